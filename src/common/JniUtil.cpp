@@ -1,0 +1,13 @@
+#include "common/JniUtil.h"
+
+bool JNI_ExceptionSweep(JNIEnv *env) {
+    if (!env->ExceptionCheck()) return false;
+    env->ExceptionDescribe();
+    env->ExceptionClear();
+    return true;
+}
+
+void JNI_ReplaceGlobalRef(JNIEnv *env, jobject &slot, jobject obj) {
+    if (slot) env->DeleteGlobalRef(slot);
+    slot = obj ? env->NewGlobalRef(obj) : nullptr;
+}

@@ -1,0 +1,1 @@
+// The driver model; see vdev.h.
