@@ -1,0 +1,54 @@
+#!/usr/bin/env bash
+# The whole test suite: installs what is missing, builds and tests the host build
+# (with the JVM tests), the controller ABI under qemu-arm, and the sanitizer builds.
+#   scripts/test.sh            everything
+#   scripts/test.sh host       one stage: host | armhf | asan | tsan | fuzz
+set -euo pipefail
+cd "$(dirname "$0")/.."
+
+packages=(cmake ninja-build g++ clang libclang-rt-14-dev googletest libgtest-dev libgmock-dev
+          libbenchmark-dev openjdk-17-jdk-headless bison python3 g++-arm-linux-gnueabihf qemu-user)
+missing=()
+for p in "${packages[@]}"; do
+  dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q "install ok installed" || missing+=("$p")
+done
+if ((${#missing[@]})); then
+  echo "== installing: ${missing[*]}"
+  sudo=""; [ "$(id -u)" -eq 0 ] || sudo="sudo"
+  $sudo env DEBIAN_FRONTEND=noninteractive apt-get update -qq
+  $sudo env DEBIAN_FRONTEND=noninteractive apt-get install -y -qq --no-install-recommends "${missing[@]}" >/dev/null
+fi
+
+stages=("$@")
+((${#stages[@]})) || stages=(host armhf asan tsan fuzz)
+
+run_preset() {
+  local preset=$1
+  echo "== $preset: configure and build"
+  cmake --preset "$preset" >/dev/null
+  cmake --build --preset "$preset"
+  echo "== $preset: tests"
+  ctest --preset "$preset" --timeout 300
+}
+
+for stage in "${stages[@]}"; do
+  case "$stage" in
+    host) run_preset default ;;
+    armhf|asan|tsan) run_preset "$stage" ;;
+    fuzz)
+      echo "== fuzz: bounded libFuzzer runs"
+      cmake --preset fuzz >/dev/null
+      cmake --build --preset fuzz
+      for f in build/fuzz/tests/fuzz/fuzz_*; do
+        [ -x "$f" ] || continue
+        corpus="tests/fuzz/corpus/$(basename "$f")"
+        mkdir -p "build/fuzz/corpus/$(basename "$f")"
+        args=("build/fuzz/corpus/$(basename "$f")")
+        [ -d "$corpus" ] && args+=("$corpus")
+        "$f" -max_total_time="${FUZZ_SECONDS:-60}" -rss_limit_mb=2048 -print_final_stats=1 "${args[@]}" 2>&1 | tail -n 12
+      done
+      ;;
+    *) echo "unknown stage: $stage" >&2; exit 2 ;;
+  esac
+done
+echo "== all stages passed: ${stages[*]}"

@@ -1,0 +1,124 @@
+// Start-up of the bridge: report file, key file and the two notification queues,
+// and the initialisation message.
+#include <fcntl.h>
+#include <sys/ipc.h>
+#include <sys/msg.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include <gtest/gtest.h>
+
+#include "LoggerHost.h"
+#include "adapter/USB.h"
+#include "support/MsgQueue.h"
+#include "support/TempRoot.h"
+
+namespace {
+
+std::string ReadFile(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    std::stringstream ss;
+    ss << in.rdbuf();
+    return ss.str();
+}
+
+class BridgeQueues : public ::testing::Test {
+protected:
+    void SetUp() override {
+        LoggerHost_StartCapture();
+        globalPrnMsgQ = -1;
+        globalScanMsgQ = -1;
+    }
+    void TearDown() override {
+        RemoveQueue(globalPrnMsgQ);
+        RemoveQueue(globalScanMsgQ);
+    }
+    TempRoot root;
+};
+
+TEST_F(BridgeQueues, FirstStartWritesPlaceholderReportLine) {
+    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("MX-4070N"), 1);
+    EXPECT_EQ(ReadFile(root / REPORT_FILE), std::string("0000-00000000000\tMX-4070N"));
+}
+
+TEST_F(BridgeQueues, ExistingReportFileIsLeftUntouched) {
+    const std::string existing = "1234-56789012345\tOLD-MODEL\n";
+    std::ofstream(root / REPORT_FILE, std::ios::binary) << existing;
+    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("NEW-MODEL"), 1);
+    EXPECT_EQ(ReadFile(root / REPORT_FILE), existing);
+}
+
+TEST_F(BridgeQueues, OverlongModelNameIsCutToTheReportBuffer) {
+    const std::string longName(200, 'M');
+    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs(longName.c_str()), 1);
+    std::string line = ReadFile(root / REPORT_FILE);
+    EXPECT_EQ(line.size(), static_cast<size_t>(USB_SERIAL_SIZE - 1));
+    EXPECT_EQ(line.substr(0, 17), "0000-00000000000\t");
+}
+
+TEST_F(BridgeQueues, QueuesUseTheKeyFileWithProjectIdsFiveAndSix) {
+    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
+    const std::string keyFile = root / FTOK_FILE;
+    ASSERT_TRUE(std::filesystem::exists(keyFile));
+    EXPECT_EQ(globalPrnMsgQ.load(), msgget(ftok(keyFile.c_str(), 5), 0));
+    EXPECT_EQ(globalScanMsgQ.load(), msgget(ftok(keyFile.c_str(), 6), 0));
+    EXPECT_NE(globalPrnMsgQ.load(), globalScanMsgQ.load());
+    EXPECT_TRUE(LoggerHost_Contains("[USBAdp][USB]Prn_MsgQ created with message queue id : "));
+    EXPECT_TRUE(LoggerHost_Contains("[USBAdp][USB]Scan_MsgQ created with message queue id : "));
+}
+
+TEST_F(BridgeQueues, ExistingQueuesAreReusedWithWhatTheyHold) {
+    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
+    const int first = globalPrnMsgQ;
+    ASSERT_EQ(USBAdapter_IF_InitDevice(), 1);
+    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
+    EXPECT_EQ(globalPrnMsgQ.load(), first);
+    EXPECT_EQ(TakeQueueStatus(globalPrnMsgQ), MFP_DEV_INIT);
+}
+
+TEST_F(BridgeQueues, MissingKeyFileDirectoryFailsCleanly) {
+    std::filesystem::remove_all(root / "/halvard/spool");
+    EXPECT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 0);
+    const std::string keyFile = root / FTOK_FILE;
+    EXPECT_TRUE(LoggerHost_Contains("[USBAdp][USB]Error Cannot open file for ftok key: " + keyFile + ", errno: 2\n"));
+    EXPECT_TRUE(LoggerHost_Contains("No tmp file /halvard/spool, errno: 2\n"));
+    EXPECT_EQ(globalPrnMsgQ.load(), -1);
+    EXPECT_EQ(globalScanMsgQ.load(), -1);
+}
+
+TEST_F(BridgeQueues, UnwritableReportDirectoryFailsBeforeAnyQueue) {
+    std::filesystem::remove_all(root / "/halvard/sys");
+    EXPECT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 0);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp][USB]Error in opening file/File doesn't exist.\n"), 1);
+    EXPECT_FALSE(LoggerHost_Contains("Creating message queues"));
+    EXPECT_EQ(globalPrnMsgQ.load(), -1);
+}
+
+TEST_F(BridgeQueues, InitDevicePostsOneInitMessageOfEightBytes) {
+    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
+    ASSERT_EQ(USBAdapter_IF_InitDevice(), 1);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp][USB]Message sent for initialization.. \n"), 1);
+
+    struct {
+        long mtype;
+        unsigned char text[64];
+    } raw{};
+    ssize_t n = msgrcv(globalPrnMsgQ, &raw, sizeof raw.text, 0, IPC_NOWAIT);
+    ASSERT_EQ(n, 8);
+    EXPECT_EQ(raw.mtype, 1);
+    EXPECT_EQ(raw.text[0] | raw.text[1] << 8 | raw.text[2] << 16 | raw.text[3] << 24, MFP_DEV_INIT);
+    EXPECT_EQ(TakeQueueStatus(globalPrnMsgQ), std::nullopt);
+    EXPECT_EQ(TakeQueueStatus(globalScanMsgQ), std::nullopt);
+}
+
+TEST_F(BridgeQueues, InitDeviceWithoutQueueReportsFailure) {
+    globalPrnMsgQ = -1;
+    EXPECT_EQ(USBAdapter_IF_InitDevice(), 0);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp][USB]-1, 1, 0\n"), 1);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp][USB]Prn_msgQ message can't be send. \n"), 1);
+}
+
+}  // namespace

@@ -1,0 +1,97 @@
+// The logging path and the fixed-path helper as the platform and tests see them.
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <fstream>
+#include <sstream>
+#include <thread>
+
+#include <gtest/gtest.h>
+
+#include "LoggerHost.h"
+#include "common/FixedPath.h"
+#include "common/Log.h"
+#include "support/TempRoot.h"
+
+namespace {
+
+TEST(FixedPath, UnsetRootKeepsTheControllerPath) {
+    ::unsetenv("USBADAPTER_ROOT");
+    EXPECT_EQ(FixedPath("/halvard/sys/statusinfo/usb_speed.txt"), "/halvard/sys/statusinfo/usb_speed.txt");
+}
+
+TEST(FixedPath, RootIsPrefixedOnce) {
+    ::setenv("USBADAPTER_ROOT", "/tmp/r/", 1);
+    EXPECT_EQ(FixedPath("/proc/cpu_temp"), "/tmp/r/proc/cpu_temp");
+    ::setenv("USBADAPTER_ROOT", "", 1);
+    EXPECT_EQ(FixedPath("/proc/cpu_temp"), "/proc/cpu_temp");
+    ::unsetenv("USBADAPTER_ROOT");
+}
+
+TEST(Logging, MacroPassesLevelAndCallingFunction) {
+    LoggerHost_StartCapture();
+    USBADP_LOG(ERROR, "[USBAdp] value %d\n", 42);
+    USBADP_LOG(DEBUG, "x");
+    auto lines = LoggerHost_Captured();
+    ASSERT_EQ(lines.size(), 2u);
+    EXPECT_EQ(lines[0].level, 40000);
+    EXPECT_EQ(lines[0].levelName, "ERROR");
+    EXPECT_EQ(lines[0].text, "[USBAdp] value 42\n");
+    EXPECT_EQ(lines[0].function, "TestBody");
+    EXPECT_EQ(lines[1].level, 10000);
+    EXPECT_EQ(lines[1].levelName, "DEBUG");
+}
+
+TEST(Logging, DeferredLinesArriveInOrderThroughTheSameLogger) {
+    LoggerHost_StartCapture();
+    for (long i = 0; i < 10; ++i) USBADP_LOG_ASYNC(INFO, "[USBAdp] n=%ld\n", i);
+    Log_FlushDeferred();
+    auto lines = LoggerHost_Captured();
+    ASSERT_EQ(lines.size(), 10u);
+    for (int i = 0; i < 10; ++i) EXPECT_EQ(lines[i].text, "[USBAdp] n=" + std::to_string(i) + "\n");
+    EXPECT_EQ(lines[0].function, "TestBody");
+}
+
+TEST(Logging, FullDeferredQueueDropsAndCountsInsteadOfBlocking) {
+    LoggerHost_StartCapture();
+    const unsigned long before = Log_DeferredDropped();
+    for (long i = 0; i < 1000; ++i) USBADP_LOG_ASYNC(INFO, "%ld\n", i);
+    Log_FlushDeferred();
+    const auto kept = LoggerHost_Captured().size();
+    EXPECT_GT(kept, 0u);
+    EXPECT_LT(kept, 1000u);
+    EXPECT_EQ(kept + (Log_DeferredDropped() - before), 1000u);
+}
+
+TEST(Logging, WorkerPrintsDeferredLinesWithoutAFlush) {
+    LoggerHost_StartCapture();
+    Log_StartDeferredWorker();
+    USBADP_LOG_ASYNC(INFO, "[USBAdp] from a handler %ld\n", 7L);
+    for (int i = 0; i < 500 && !LoggerHost_Contains("from a handler 7"); ++i)
+        std::this_thread::sleep_for(std::chrono::milliseconds(2));
+    EXPECT_TRUE(LoggerHost_Contains("[USBAdp] from a handler 7\n"));
+}
+
+// The sink is chosen once per process from the environment: check it in a child.
+TEST(Logging, FileSinkFiltersByLevelAndWritesOneLinePerCall) {
+    TempRoot root;
+    const std::string file = root.path() + "/log.txt";
+    pid_t pid = fork();
+    ASSERT_GE(pid, 0);
+    if (pid == 0) {
+        ::setenv("USBADAPTER_LOG", file.c_str(), 1);
+        ::setenv("USBADAPTER_LOG_LEVEL", "INFO", 1);
+        USBADP_LOG(DEBUG, "hidden\n");
+        USBADP_LOG(INFO, "\r\n[USBAdp] shown %s\n", "one");
+        USBADP_LOG(ERROR, "[USBAdp] shown two");
+        _exit(0);
+    }
+    int status = 0;
+    waitpid(pid, &status, 0);
+    std::ifstream in(file);
+    std::stringstream ss;
+    ss << in.rdbuf();
+    EXPECT_EQ(ss.str(), "INFO  TestBody: [USBAdp] shown one\nERROR TestBody: [USBAdp] shown two\n");
+}
+
+}  // namespace
