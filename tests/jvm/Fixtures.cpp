@@ -1,0 +1,151 @@
+#include "Fixtures.h"
+
+#include <sstream>
+
+#include "JvmHarness.h"
+
+namespace fixtures {
+namespace {
+
+// A local reference released at scope end.
+struct Local {
+    JNIEnv *env;
+    jobject obj;
+    ~Local() {
+        if (obj) env->DeleteLocalRef(obj);
+    }
+};
+
+std::string StaticString(const char *name, const char *sig, jint arg) {
+    JNIEnv *env = jvm::Env();
+    Local s{env, jvm::CallStaticObject(kJournal, name, sig, arg)};
+    return jvm::Text(env, static_cast<jstring>(s.obj));
+}
+
+std::string StaticBytes(const char *name, jint arg) {
+    JNIEnv *env = jvm::Env();
+    Local a{env, jvm::CallStaticObject(kJournal, name, "(I)[B", arg)};
+    return jvm::Bytes(env, static_cast<jbyteArray>(a.obj));
+}
+
+}  // namespace
+
+void Reset() { jvm::CallStaticVoid(kJournal, "reset", "()V"); }
+
+std::string Events() {
+    JNIEnv *env = jvm::Env();
+    Local s{env, jvm::CallStaticObject(kJournal, "events", "()Ljava/lang/String;")};
+    return jvm::Text(env, static_cast<jstring>(s.obj));
+}
+
+std::vector<std::string> EventLines() {
+    std::vector<std::string> lines;
+    std::istringstream in(Events());
+    for (std::string line; std::getline(in, line);) lines.push_back(line);
+    return lines;
+}
+
+int Calls(const std::string &method) {
+    JNIEnv *env = jvm::Env();
+    Local s{env, jvm::Str(env, method.c_str())};
+    return jvm::CallStaticInt(kJournal, "calls", "(Ljava/lang/String;)I", s.obj);
+}
+
+bool AwaitCalls(const std::string &method, int count, int timeoutMs) {
+    JNIEnv *env = jvm::Env();
+    Local s{env, jvm::Str(env, method.c_str())};
+    return jvm::CallStaticBoolean(kJournal, "awaitCalls", "(Ljava/lang/String;IJ)Z", s.obj, jint{count},
+                                  jlong{timeoutMs});
+}
+
+int JobCount() { return jvm::CallStaticInt(kJournal, "jobCount", "()I"); }
+
+std::string JobFileName(int job) { return StaticString("jobFileName", "(I)Ljava/lang/String;", job); }
+
+std::string JobBytes(int job) { return StaticBytes("jobBytes", job); }
+
+std::vector<int> JobChunkSizes(int job) {
+    JNIEnv *env = jvm::Env();
+    Local a{env, jvm::CallStaticObject(kJournal, "jobChunkSizes", "(I)[I", jint{job})};
+    std::vector<int> sizes;
+    if (!a.obj) return sizes;
+    auto arr = static_cast<jintArray>(a.obj);
+    sizes.resize(static_cast<size_t>(env->GetArrayLength(arr)));
+    std::vector<jint> raw(sizes.size());
+    env->GetIntArrayRegion(arr, 0, static_cast<jsize>(raw.size()), raw.data());
+    for (size_t i = 0; i < raw.size(); ++i) sizes[i] = raw[i];
+    return sizes;
+}
+
+long long JobByteCount(int job) { return jvm::CallStaticLong(kJournal, "jobByteCount", "(I)J", jint{job}); }
+
+std::string JobSha256(int job) { return StaticString("jobSha256", "(I)Ljava/lang/String;", job); }
+
+bool JobEnded(int job) { return jvm::CallStaticBoolean(kJournal, "jobEnded", "(I)Z", jint{job}); }
+
+bool AwaitJobEnded(int job, int timeoutMs) {
+    return jvm::CallStaticBoolean(kJournal, "awaitJobEnded", "(IJ)Z", jint{job}, jlong{timeoutMs});
+}
+
+int AppCount() { return jvm::CallStaticInt(kJournal, "appCount", "()I"); }
+
+std::string AppType(int app) { return StaticString("appType", "(I)Ljava/lang/String;", app); }
+
+std::string AppBytes(int app) { return StaticBytes("appBytes", app); }
+
+int AppWriteCount(int app) { return jvm::CallStaticInt(kJournal, "appWriteCount", "(I)I", jint{app}); }
+
+bool AppClosed(int app) { return jvm::CallStaticBoolean(kJournal, "appClosed", "(I)Z", jint{app}); }
+
+std::string Sha256(const std::string &bytes) {
+    JNIEnv *env = jvm::Env();
+    Local a{env, jvm::ByteArray(env, bytes)};
+    Local s{env, jvm::CallStaticObject(kJournal, "sha256", "([B)Ljava/lang/String;", a.obj)};
+    return jvm::Text(env, static_cast<jstring>(s.obj));
+}
+
+void ThrowOn(const std::string &method, int times) {
+    JNIEnv *env = jvm::Env();
+    Local s{env, jvm::Str(env, method.c_str())};
+    jvm::CallStaticVoid(kJournal, "throwOn", "(Ljava/lang/String;I)V", s.obj, jint{times});
+}
+
+void ReturnNull(const std::string &method, bool on) {
+    JNIEnv *env = jvm::Env();
+    Local s{env, jvm::Str(env, method.c_str())};
+    jvm::CallStaticVoid(kJournal, "returnNull", "(Ljava/lang/String;Z)V", s.obj, jboolean{on});
+}
+
+void SetPrinterStatus(int status) { jvm::CallStaticVoid(kJournal, "setPrinterStatus", "(I)V", jint{status}); }
+
+void SetInterpreters(const std::vector<int> &ids) {
+    JNIEnv *env = jvm::Env();
+    std::vector<jint> raw(ids.begin(), ids.end());
+    jintArray arr = env->NewIntArray(static_cast<jsize>(raw.size()));
+    Local a{env, arr};
+    if (!arr) return;
+    env->SetIntArrayRegion(arr, 0, static_cast<jsize>(raw.size()), raw.data());
+    jvm::CallStaticVoid(kJournal, "setInterpreters", "([I)V", arr);
+}
+
+void SetReply(const std::string &method, const std::string &reply) {
+    JNIEnv *env = jvm::Env();
+    Local m{env, jvm::Str(env, method.c_str())};
+    Local r{env, jvm::Str(env, reply.c_str())};
+    jvm::CallStaticVoid(kJournal, "setReply", "(Ljava/lang/String;Ljava/lang/String;)V", m.obj, r.obj);
+}
+
+void SetIntReply(const std::string &method, int reply) {
+    JNIEnv *env = jvm::Env();
+    Local m{env, jvm::Str(env, method.c_str())};
+    jvm::CallStaticVoid(kJournal, "setIntReply", "(Ljava/lang/String;I)V", m.obj, jint{reply});
+}
+
+void SetBytesReply(const std::string &method, const std::string &bytes) {
+    JNIEnv *env = jvm::Env();
+    Local m{env, jvm::Str(env, method.c_str())};
+    Local a{env, jvm::ByteArray(env, bytes)};
+    jvm::CallStaticVoid(kJournal, "setBytesReply", "(Ljava/lang/String;[B)V", m.obj, a.obj);
+}
+
+}  // namespace fixtures
