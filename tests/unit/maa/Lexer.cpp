@@ -1,0 +1,205 @@
+// Tokenising of command lines: operators, type words, constants, strings,
+// and the lines that end or are rejected early.
+#include <vector>
+
+#include "maa/ShellFixture.h"
+
+namespace maatest {
+namespace {
+
+class Lexer : public ShellTest {
+protected:
+    void TearDown() override {
+        MAA_FreeParamString();
+        ShellTest::TearDown();
+    }
+    // Every token code up to (not including) the end; identifier texts go to names.
+    static std::vector<U32> tokens(const char *line) {
+        lineBuffer = line;
+        names.clear();
+        MAA_InputSet(reinterpret_cast<const U8 *>(lineBuffer.c_str()));
+        std::vector<U32> out;
+        for (U32 t; (t = MAA_TokenDivider()) != 0;) {
+            out.push_back(t);
+            if (t == IDENTIFIER) {
+                names.push_back(reinterpret_cast<char *>(stVal.pubSymbol));
+                MAA_Free(stVal.pubSymbol);
+            }
+        }
+        return out;
+    }
+    inline static std::vector<std::string> names;
+    static U32 single(const char *line) {
+        auto t = tokens(line);
+        EXPECT_EQ(t.size(), 1u) << line;
+        return t.empty() ? 0 : t.front();
+    }
+    static U32 constant(const char *line) {
+        lineBuffer = line;
+        MAA_InputSet(reinterpret_cast<const U8 *>(lineBuffer.c_str()));
+        EXPECT_EQ(MAA_TokenDivider(), CONSTANT) << line;
+        return stVal.ulNumber;
+    }
+};
+
+constexpr U32 I = IDENTIFIER;
+
+TEST_F(Lexer, OperatorsTakeTheLongestMatch) {
+    struct Case {
+        const char *text;
+        std::vector<U32> expected;
+    } cases[] = {
+        {"a|&b", {I, LOR, I}},
+        {"a||b", {I, '|', '|', I}},
+        {"x<<=2", {I, LSE, CONSTANT}},
+        {"x<<2", {I, LS, CONSTANT}},
+        {"x>>=2 x>>2 x>=2 x<=2", {I, RSE, CONSTANT, I, RS, CONSTANT, I, GE, CONSTANT, I, LE, CONSTANT}},
+        {"== != += ++ -= -- *= /= %= ^= &= && |=", {EQ, NE, PE, PP, ME, MM, TE, DE, RE, EXE, AE, LAND, OE}},
+        {"+++", {PP, '+'}},
+        {"( ) , : ; ? ~ ! % & * + - / < = > ^ |",
+         {'(', ')', ',', ':', ';', '?', '~', '!', '%', '&', '*', '+', '-', '/', '<', '=', '>', '^', '|'}},
+        {" \t\v\f\r\n x", {I}},
+    };
+    for (const Case &c : cases) EXPECT_EQ(tokens(c.text), c.expected) << c.text;
+}
+
+TEST_F(Lexer, NamesBeginningWithATypeWordAreThatTypeWord) {
+    EXPECT_EQ(tokens("integer"), std::vector<U32>{R_INT});
+    EXPECT_EQ(tokens("longitude chart shortcut int"), (std::vector<U32>{R_LONG, R_CHAR, R_SHORT, R_INT}));
+    EXPECT_EQ(tokens("Int in_1x _9"), (std::vector<U32>{I, I, I}));
+    EXPECT_EQ(names, (std::vector<std::string>{"Int", "in_1x", "_9"}));
+}
+
+TEST_F(Lexer, NumbersAreDecimalOrHexadecimalAndDropOverflowingDigits) {
+    EXPECT_EQ(constant("0x1F"), 31u);
+    EXPECT_EQ(constant("0X1f"), 31u);
+    EXPECT_EQ(constant("010"), 10u);
+    EXPECT_EQ(constant("017"), 17u);
+    EXPECT_EQ(constant("4294967295"), 0xFFFFFFFFu);
+    EXPECT_EQ(constant("4294967296"), 429496729u);
+    EXPECT_EQ(constant("0xFFFFFFFFF"), 0xFFFFFFFFu);
+    // "0x" without a digit is the constant 0 and leaves the input at the "0".
+    EXPECT_EQ(constant("0xg"), 0u);
+    EXPECT_EQ(MAA_TokenDivider(), CONSTANT);
+    EXPECT_EQ(run("0x"), 1u);
+}
+
+TEST_F(Lexer, StringToNumberConversion) {
+    const U8 *end = nullptr;
+    auto logic = [&end](const char *text, U32 base) {
+        return MAA_Logic(reinterpret_cast<const U8 *>(text), &end, base);
+    };
+    const char *text = "  -1z";
+    EXPECT_EQ(logic(text, 10), ~1u);  // complement, not negation
+    EXPECT_EQ(end, reinterpret_cast<const U8 *>(text + 4));
+    EXPECT_EQ(logic("017", 0), 15u);
+    EXPECT_EQ(logic("0x10", 0), 16u);
+    EXPECT_EQ(logic("zz", 36), 36u * 35 + 35);
+    text = "xyz";
+    EXPECT_EQ(logic(text, 10), 0u);
+    EXPECT_EQ(end, reinterpret_cast<const U8 *>(text));
+}
+
+TEST_F(Lexer, CharacterConstantsAndEscapes) {
+    EXPECT_EQ(constant("'\\n'"), 10u);
+    EXPECT_EQ(constant("'\\x41'"), 65u);
+    EXPECT_EQ(constant("'\\101'"), 65u);
+    EXPECT_EQ(constant("'\\777'"), 255u);
+    EXPECT_EQ(constant("'\\''"), 39u);
+    EXPECT_EQ(constant("'a'"), 97u);
+
+    const char *text = "\\1234";
+    const U8 *p = reinterpret_cast<const U8 *>(text);
+    EXPECT_EQ(MAA_DecodeEscape(&p), 0123);  // at most three octal digits
+    EXPECT_EQ(*p, '4');
+    text = "\\x4142";
+    p = reinterpret_cast<const U8 *>(text);
+    EXPECT_EQ(MAA_DecodeEscape(&p), 0x41);  // at most two hexadecimal digits
+    EXPECT_EQ(*p, '4');
+
+    EXPECT_EQ(tokens("'ab'"), std::vector<U32>{});
+    EXPECT_TRUE(LoggerHost_Contains("\r\ninvalid charactor constant"));
+    EXPECT_FALSE(fMAALineReject);
+}
+
+TEST_F(Lexer, StringLiteralsAreDecodedRecordedAndAddressable) {
+    lineBuffer = "\"a\\tb\"";
+    MAA_InputSet(reinterpret_cast<const U8 *>(lineBuffer.c_str()));
+    ASSERT_EQ(MAA_TokenDivider(), STRING);
+    EXPECT_STREQ(reinterpret_cast<char *>(stVal.pubString), "a\tb");
+    EXPECT_EQ(ulAllocCount, 1u);
+    EXPECT_EQ(paubAllocTable[0], stVal.pubString);
+    U32 address = MAA_AddrOf(stVal.pubString);
+    EXPECT_GT(address, 1000000u);
+    EXPECT_STREQ(MAA_AddrString(address), "a\tb");
+
+    MAA_FreeParamString();
+    EXPECT_EQ(ulAllocCount, 0u);
+    EXPECT_EQ(MAA_AddrString(address), nullptr);  // gone with the line
+}
+
+TEST_F(Lexer, AnUnterminatedStringEndsTheLine) {
+    EXPECT_EQ(tokens("x \"abc"), std::vector<U32>{I});
+    EXPECT_TRUE(LoggerHost_Contains("\r\ninvalid string"));
+    EXPECT_EQ(MAA_TokenDivider(), 0u);
+    EXPECT_EQ(inpptr, nullptr);
+}
+
+TEST_F(Lexer, AnUnknownCharacterEndsTheLineThere) {
+    auto t = tokens("f(1) [2]");
+    EXPECT_EQ(t, (std::vector<U32>{I, '(', CONSTANT, ')'}));
+    EXPECT_EQ(MAA_TokenDivider(), 0u);
+    EXPECT_FALSE(fMAALineReject);
+    EXPECT_EQ(tokens("a.b"), std::vector<U32>{I});
+    EXPECT_EQ(tokens("\xc3\xa9"), std::vector<U32>{});
+}
+
+TEST_F(Lexer, AnUnknownEscapeRejectsTheLine) {
+    EXPECT_EQ(tokens("\"a\\qb\" x"), std::vector<U32>{});
+    EXPECT_TRUE(fMAALineReject);
+    EXPECT_TRUE(LoggerHost_Contains("*ptr >= '0' && *ptr <= '7'"));
+    EXPECT_EQ(ulAllocCount, 0u);
+
+    EXPECT_EQ(tokens("'\\z'"), std::vector<U32>{});
+    EXPECT_TRUE(fMAALineReject);
+    EXPECT_EQ(tokens("\"\\"), std::vector<U32>{});  // backslash at the end of the line
+    EXPECT_TRUE(fMAALineReject);
+}
+
+TEST_F(Lexer, TwentyStringLiteralsFitATwentyFirstRejectsTheLine) {
+    std::string line;
+    for (int i = 0; i < 20; ++i) line += "\"s\",";
+    EXPECT_EQ(tokens(line.c_str()).size(), 40u);
+    EXPECT_FALSE(fMAALineReject);
+    EXPECT_EQ(ulAllocCount, 20u);
+
+    line += "\"t\"";
+    EXPECT_EQ(tokens(line.c_str()).size(), 40u);  // InputSet released the earlier ones
+    EXPECT_TRUE(fMAALineReject);
+    EXPECT_EQ(ulAllocCount, 20u);
+    EXPECT_TRUE(LoggerHost_Contains("too many string literals"));
+}
+
+TEST_F(Lexer, GetTokenMapsToParserSymbolsAndUngetRepeatsTheToken) {
+    lineBuffer = "abc;integer";
+    MAA_InputSet(reinterpret_cast<const U8 *>(lineBuffer.c_str()));
+    TStackData v{};
+    EXPECT_EQ(MAA_GetToken(&v), 3u);
+    U8 *name = v.pubSymbol;
+    MAA_UngetToken();
+    TStackData again{};
+    EXPECT_EQ(MAA_GetToken(&again), 3u);
+    EXPECT_EQ(again.pubSymbol, name);
+    MAA_Free(name);
+    EXPECT_EQ(MAA_GetToken(&v), 6u);
+    EXPECT_EQ(MAA_GetToken(&v), 48u);
+    EXPECT_EQ(MAA_GetToken(&v), 0u);
+
+    EXPECT_EQ(MAA_GetSymbolCode(LOR), 40u);
+    EXPECT_EQ(MAA_GetSymbolCode(':'), 44u);
+    EXPECT_EQ(MAA_GetSymbolCode(256), 2u);
+    EXPECT_EQ(MAA_GetSymbolCode('['), 0xFFFFFFFFu);
+}
+
+}  // namespace
+}  // namespace maatest

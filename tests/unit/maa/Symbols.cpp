@@ -1,0 +1,92 @@
+// The symbol table: lookup order, the general function, printing and the dump
+// records a host receives.
+#include "maa/ShellFixture.h"
+
+namespace maatest {
+namespace {
+
+class Symbols : public ShellTest {};
+
+TEST_F(Symbols, TheNewestOfTwoEqualNamesIsFoundFirst) {
+    U32 first = MAA_FuncEntry<f0>(), second = MAA_FuncEntry<g0>();
+    MAA_SymbolAdd(ftarget_ppc, "f", MAA_SYM_FUNC_HIDE, first, 0);
+    MAA_SymbolAdd(ftarget_ppc, "f", MAA_SYM_FUNC_HIDE, second, 0);
+    EXPECT_TRUE(LoggerHost_Contains("\r\n Add Symbol Start:f"));
+    ASSERT_NE(MAA_SymbolFind("f"), nullptr);
+    EXPECT_EQ(MAA_SymbolFind("f")->ulAddress, second);
+    EXPECT_EQ(MAA_SymbolFindAddress(first)->ulAddress, first);
+    EXPECT_EQ(MAA_SymbolFindAddress(second)->ulAddress, second);
+    EXPECT_EQ(MAA_SymbolFind("F"), nullptr);  // case-sensitive
+    EXPECT_EQ(MAA_SymbolFind("f "), nullptr);  // whole names
+    EXPECT_EQ(MAA_SymbolFindAddress(first + 4 * 100), nullptr);
+
+    run("f()");
+    ASSERT_EQ(calls.size(), 1u);
+    EXPECT_EQ(calls[0].function, "g0");
+}
+
+TEST_F(Symbols, TheTableKeepsItsOwnCopyOfTheName) {
+    char name[] = "temp";
+    MAA_SymbolAdd(ftarget_ppc, name, MAA_SYM_FUNC, 123, 1);
+    name[0] = 'x';
+    TSymbol *sym = MAA_SymbolFind("temp");
+    ASSERT_NE(sym, nullptr);
+    EXPECT_EQ(sym->ubPramCount, 1);
+    EXPECT_EQ(sym->fMaaTarget, ftarget_ppc);
+}
+
+TEST_F(Symbols, OneGeneralFunctionTheLaterReplacesTheEarlier) {
+    EXPECT_EQ(MAA_GetGeneralSymbol(), 0u);
+    MAA_SymbolAddGeneral(ftarget_ppc, "G1", MAA_SYM_FUNC_HIDE, 1111, 2);
+    MAA_SymbolAddGeneral(ftarget_ppc, "MAA_GENERAL_FUNCTION", MAA_SYM_FUNC_HIDE, 2222, 2);
+    EXPECT_EQ(MAA_GetGeneralSymbol(), 2222u);
+    EXPECT_TRUE(LoggerHost_Contains("\r\n Add General Symbol Start:MAA_GENERAL_FUNCTION"));
+    // Not part of the named list.
+    EXPECT_EQ(MAA_SymbolFind("MAA_GENERAL_FUNCTION"), nullptr);
+    EXPECT_EQ(MAA_SymbolFindAddress(2222), nullptr);
+}
+
+TEST_F(Symbols, PrintNamesTheKindAndTheEntry) {
+    MAA_SymbolPrint(MAA_SymbolAdd(ftarget_ppc, "a", MAA_SYM_FUNC, 0x10, 0));
+    MAA_SymbolPrint(MAA_SymbolAdd(ftarget_ppc, "b", MAA_SYM_DATA, 0x20, 0));
+    MAA_SymbolPrint(MAA_SymbolAdd(ftarget_ppc, "c", MAA_SYM_FUNC_HIDE, 0x30, 0));
+    std::vector<std::string> texts;
+    for (const LoggedLine &l : LoggerHost_Captured()) {
+        if (l.function == "MAA_SymbolPrint") texts.push_back(l.text);
+    }
+    EXPECT_EQ(texts, (std::vector<std::string>{"\r\nFUNC ", "\r\nvalue = 0x10", "\r\nDATA ", "\r\nvalue = 0x20",
+                                               "\r\nunknown(4) ", "\r\nvalue = 0x30"}));
+}
+
+TEST_F(Symbols, TheDumpListsKindOneNamesAndCountsAllButKindFour) {
+    U32 data = 0;
+    MAA_SymbolAdd(ftarget_all, "MAA_SymbolDump", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<MAA_SymbolDump>(), 0);
+    MAA_SymbolAdd(ftarget_ppc, "Pattern_Print", MAA_SYM_FUNC, MAA_FuncEntry<f2>(), 2);
+    MAA_SymbolAdd(ftarget_ppc, "hidden", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<f0>(), 0);
+    addData("counter", &data);
+    MAA_SymbolAdd(ftarget_ppc, "SPI_Get_Log", MAA_SYM_FUNC, MAA_FuncEntry<g0>(), 0);
+
+    EXPECT_EQ(run("MAA_SymbolDump()"), 0u);
+
+    const std::string rule = "======================================";
+    std::vector<Record> expected = {
+        {MAA_RESULT_CONTINUE, 0, rule},
+        {MAA_RESULT_CONTINUE, 0, "|                    Symbol Name                 "},
+        {MAA_RESULT_CONTINUE, 0, rule},
+        {MAA_RESULT_CONTINUE, 0, "   SPI_Get_Log  "},
+        {MAA_RESULT_CONTINUE, 0, "   Pattern_Print  "},
+        {MAA_RESULT_CONTINUE, 0, rule},
+        {MAA_RESULT_CONTINUE, 1, "The Number Of Symbol : 3 "},
+        {MAA_RESULT_END, 1, ""},
+    };
+    ASSERT_EQ(records.size(), expected.size());
+    for (size_t i = 0; i < expected.size(); ++i) {
+        EXPECT_EQ(records[i].enContinue, expected[i].enContinue) << i;
+        EXPECT_EQ(records[i].ulResult, expected[i].ulResult) << i;
+        EXPECT_EQ(records[i].data, expected[i].data) << i;
+    }
+    EXPECT_TRUE(LoggerHost_Contains("unknown(2) "));
+}
+
+}  // namespace
+}  // namespace maatest
