@@ -38,14 +38,19 @@ for stage in "${stages[@]}"; do
     fuzz)
       echo "== fuzz: bounded libFuzzer runs"
       cmake --preset fuzz >/dev/null
-      cmake --build --preset fuzz
-      for f in build/fuzz/tests/fuzz/fuzz_*; do
-        [ -x "$f" ] || continue
-        corpus="tests/fuzz/corpus/$(basename "$f")"
-        mkdir -p "build/fuzz/corpus/$(basename "$f")"
-        args=("build/fuzz/corpus/$(basename "$f")")
-        [ -d "$corpus" ] && args+=("$corpus")
-        "$f" -max_total_time="${FUZZ_SECONDS:-60}" -rss_limit_mb=2048 -print_final_stats=1 "${args[@]}" 2>&1 | tail -n 12
+      targets=()
+      for src in tests/fuzz/*.cpp; do targets+=("$(basename "$src" .cpp)"); done
+      cmake --build --preset fuzz --target "${targets[@]}"
+      for t in "${targets[@]}"; do
+        # Scratch corpus first, so the checked-in seeds are never rewritten.
+        scratch="build/fuzz/corpus/$t"; mkdir -p "$scratch"
+        args=(-max_total_time="${FUZZ_SECONDS:-60}" -rss_limit_mb=2048 -max_len=1100 "$scratch")
+        [ -f "tests/fuzz/$t.dict" ] && args=(-dict="tests/fuzz/$t.dict" "${args[@]}")
+        [ -d "tests/fuzz/corpus/$t" ] && args+=("tests/fuzz/corpus/$t")
+        echo "-- $t"
+        rc=0; "build/fuzz/tests/fuzz/$t" "${args[@]}" >"build/fuzz/$t.log" 2>&1 || rc=$?
+        grep -E '^(#[0-9]+ +DONE|Done [0-9]+ runs|==[0-9]+==|SUMMARY)' "build/fuzz/$t.log" || true
+        if [ "$rc" -ne 0 ]; then tail -n 40 "build/fuzz/$t.log"; exit "$rc"; fi
       done
       ;;
     *) echo "unknown stage: $stage" >&2; exit 2 ;;
