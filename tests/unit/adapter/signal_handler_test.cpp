@@ -1,0 +1,208 @@
+// The SIGIO handler: driver notifications become queue messages and flags.
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/msg.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <thread>
+
+#include <gtest/gtest.h>
+
+#include "LoggerHost.h"
+#include "adapter/USB.h"
+#include "common/Log.h"
+#include "support/MsgQueue.h"
+#include "support/TempRoot.h"
+#include "vdev.h"
+
+namespace {
+
+mfp_notif_t Notif(U8 code, S32 forWhom) {
+    mfp_notif_t n{};
+    n.ub_notif = code;
+    n.ub_intf = forWhom;
+    return n;
+}
+
+class SignalHandler : public ::testing::Test {
+protected:
+    void SetUp() override {
+        vdev::Reset();
+        LoggerHost_StartCapture();
+        ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
+        fd = ::open(vdev::kPrn, O_RDWR);
+        ASSERT_GT(fd, 0);
+        fdPrn = fd;
+        IsConfigured = 0;
+        IsDisconnected = 0;
+        bootUpFlag = 0;
+    }
+    void TearDown() override {
+        RemoveQueue(globalPrnMsgQ);
+        RemoveQueue(globalScanMsgQ);
+        fdPrn = 0;
+        ::close(fd);
+    }
+    // Delivers one notification the way the driver does and runs the handler.
+    void Deliver(U8 code, S32 forWhom) {
+        vdev::QueueNotification(vdev::kPrn, Notif(code, forWhom));
+        PrnScanSighandler(SIGIO);
+        Log_FlushDeferred();
+    }
+    std::optional<int> Print() { return TakeQueueStatus(globalPrnMsgQ); }
+    std::optional<int> Scan() { return TakeQueueStatus(globalScanMsgQ); }
+
+    TempRoot root;
+    int fd = -1;
+};
+
+TEST_F(SignalHandler, ResetIsRoutedByWhomItIsFor) {
+    Deliver(MFP_DEV_RESET, eMfp_Notif_Prn);
+    EXPECT_EQ(Print(), MFP_DEV_RESET);
+    EXPECT_EQ(Scan(), std::nullopt);
+
+    Deliver(MFP_DEV_RESET, eMfp_Notif_Scan);
+    EXPECT_EQ(Print(), std::nullopt);
+    EXPECT_EQ(Scan(), MFP_DEV_RESET);
+
+    Deliver(MFP_DEV_RESET, eMfp_Notif_Both);
+    EXPECT_EQ(Print(), MFP_DEV_RESET);
+    EXPECT_EQ(Scan(), MFP_DEV_RESET);
+
+    EXPECT_EQ(IsConfigured.load(), 1);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread]Requested MFP_DEV_RESET message received!\n"), 3);
+}
+
+TEST_F(SignalHandler, UnknownRecipientStillProcessesTheCodeAndGoesToScan) {
+    Deliver(MFP_DEV_RESET, 7);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Request not supported!/Unwanted signal\n"), 1);
+    EXPECT_EQ(Print(), std::nullopt);
+    EXPECT_EQ(Scan(), MFP_DEV_RESET);
+}
+
+TEST_F(SignalHandler, OnlyTheFirstConfigurationIsForwarded) {
+    Deliver(MFP_DEV_CONFIGURED, eMfp_Notif_Both);
+    EXPECT_EQ(Print(), MFP_DEV_CONFIGURED);
+    EXPECT_EQ(Scan(), MFP_DEV_CONFIGURED);
+    EXPECT_EQ(bootUpFlag.load(), 1);
+
+    Deliver(MFP_DEV_DISCONNECT, eMfp_Notif_Both);
+    EXPECT_EQ(IsConfigured.load(), 0);
+    Deliver(MFP_DEV_CONFIGURED, eMfp_Notif_Both);
+    EXPECT_EQ(Print(), std::nullopt);
+    EXPECT_EQ(Scan(), std::nullopt);
+    EXPECT_EQ(IsConfigured.load(), 1);
+    EXPECT_EQ(IsDisconnected.load(), 0);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] bootUpFlag == 1\n"), 1);
+}
+
+TEST_F(SignalHandler, DisconnectPostsNothingAndFlipsTheFlags) {
+    IsConfigured = 1;
+    Deliver(MFP_DEV_DISCONNECT, eMfp_Notif_Both);
+    EXPECT_EQ(Print(), std::nullopt);
+    EXPECT_EQ(Scan(), std::nullopt);
+    EXPECT_EQ(IsConfigured.load(), 0);
+    EXPECT_EQ(IsDisconnected.load(), 1);
+    EXPECT_EQ(MAA_IsUSBDisconnected(), 1);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Requested MFP_DEV_DISCONNECT message received!\n"), 1);
+}
+
+TEST_F(SignalHandler, ScanCommandGoesToTheScanQueueOnlyWhenMeantForScan) {
+    Deliver(SCAN_COMMAND, eMfp_Notif_Scan);
+    EXPECT_EQ(Scan(), SCAN_COMMAND);
+    EXPECT_EQ(Print(), std::nullopt);
+
+    for (S32 whom : {S32{eMfp_Notif_Prn}, S32{eMfp_Notif_Both}}) {
+        LoggerHost_StartCapture();
+        Deliver(SCAN_COMMAND, whom);
+        EXPECT_EQ(Scan(), std::nullopt);
+        EXPECT_EQ(Print(), std::nullopt);
+        EXPECT_EQ(LoggerHost_Count(
+                      "[USBAdp][print thread] This signal is meant for scan but is received in wrong mode.\n."),
+                  1);
+    }
+}
+
+TEST_F(SignalHandler, UnhandledCodesAreLoggedAndNotPosted) {
+    Deliver(MFP_VENDOR_REQUEST, eMfp_Notif_Prn);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Request not supported 9\n"), 1);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Value of status: 9\n"), 1);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Value of forWhom: 1\n"), 1);
+    EXPECT_EQ(Print(), std::nullopt);
+}
+
+TEST_F(SignalHandler, FailedNotificationReadIsLoggedAndIgnored) {
+    IsConfigured = 1;
+    PrnScanSighandler(SIGIO);  // nothing pending: the driver answers with an error
+    Log_FlushDeferred();
+    EXPECT_EQ(LoggerHost_Count("ioctl[MFP_IOC_GET_NOTIF] failed.\n"), 1);
+    EXPECT_EQ(IsConfigured.load(), 1);
+    EXPECT_EQ(Print(), std::nullopt);
+    EXPECT_EQ(Scan(), std::nullopt);
+}
+
+TEST_F(SignalHandler, FailedSendIsLoggedAndKeepsTheRequestFlags) {
+    RemoveQueue(globalPrnMsgQ);
+    Deliver(MFP_DEV_RESET, eMfp_Notif_Prn);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Can't send message through Prn_MsgQ message queue.\n"), 1);
+    // The print request flag survived the failure, so the next scan-only reset
+    // is routed to the (now missing) print queue again rather than to scan.
+    Deliver(MFP_DEV_RESET, eMfp_Notif_Scan);
+    EXPECT_EQ(Scan(), std::nullopt);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Can't send message through Prn_MsgQ message queue.\n"), 2);
+}
+
+TEST_F(SignalHandler, RealSignalFromTheDriverReachesTheQueue) {
+    struct sigaction sa{};
+    sa.sa_handler = PrnScanSighandler;
+    sigemptyset(&sa.sa_mask);
+    ASSERT_EQ(sigaction(SIGIO, &sa, nullptr), 0);
+    ASSERT_EQ(fcntl(fd, F_SETOWN, getpid()), 0);
+    ASSERT_EQ(fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_ASYNC), 0);
+
+    vdev::QueueNotification(vdev::kPrn, Notif(MFP_DEV_CONFIGURED, eMfp_Notif_Prn));
+    std::optional<int> got;
+    for (int i = 0; i < 200 && !got; ++i) {
+        got = Print();
+        if (!got) std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    }
+    EXPECT_EQ(got, MFP_DEV_CONFIGURED);
+    EXPECT_EQ(IsConfigured.load(), 1);
+    signal(SIGIO, SIG_IGN);
+}
+
+// The handler must not take the logger's lock: interrupt a thread that logs
+// without pause, many times, and check every handler line arrives.
+TEST_F(SignalHandler, RunsSafelyWhileAnotherThreadIsLogging) {
+    Log_StartDeferredWorker();
+    struct sigaction sa{};
+    sa.sa_handler = PrnScanSighandler;
+    sigemptyset(&sa.sa_mask);
+    ASSERT_EQ(sigaction(SIGIO, &sa, nullptr), 0);
+
+    std::atomic<bool> stop{false};
+    std::atomic<pthread_t> loggerThread{};
+    std::thread logger([&] {
+        loggerThread = pthread_self();
+        while (!stop) USBADP_LOG(INFO, "busy %d\n", 1);
+    });
+    while (!loggerThread.load()) std::this_thread::yield();
+
+    constexpr int kSignals = 200;
+    for (int i = 0; i < kSignals; ++i) {
+        vdev::QueueNotification(vdev::kPrn, Notif(MFP_DEV_RESET, eMfp_Notif_Prn));
+        pthread_kill(loggerThread.load(), SIGIO);
+        // Drain as we go so the print queue never fills up.
+        for (int k = 0; k < 100 && !Print(); ++k) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    }
+    stop = true;
+    logger.join();
+    signal(SIGIO, SIG_IGN);
+    Log_FlushDeferred();
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread]Requested MFP_DEV_RESET message received!\n"), kSignals);
+    EXPECT_EQ(Log_DeferredDropped(), 0u);
+}
+
+}  // namespace
