@@ -3,6 +3,7 @@
 
 #include <jni.h>
 
+#include <atomic>
 #include <utility>
 
 // Describes and clears a pending Java exception so a failing Java method never
@@ -50,3 +51,5 @@ private:
 // Replaces a long-lived global reference: deletes the old one, stores a new
 // global reference to `obj` (or null).
 void JNI_ReplaceGlobalRef(JNIEnv *env, jobject &slot, jobject obj);
+// The same for a slot that other threads read.
+void JNI_ReplaceGlobalRef(JNIEnv *env, std::atomic<jobject> &slot, jobject obj);

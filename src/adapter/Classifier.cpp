@@ -1,0 +1,357 @@
+#include "adapter/Classifier.h"
+
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+
+#include "adapter/USB.h"
+#include "adapter/prn_thread.h"
+#include "common/ByteOrder.h"
+#include "common/Log.h"
+#include "firmware/FirmWareUpdate.h"
+#include "maa/MAA_Hook.h"
+#include "print/USBPrint.h"
+#include "scan/USBScan.h"
+#include "vendor/VLX_Main.h"
+
+const U8 UELPattern[UEL_PATTERN_SIZE] = {0x1B, '%', '-', '1', '2', '3', '4', '5', 'X'};
+
+const char aubHostApp[11][HOST_APP_NAME_SIZE] = {"PC_SCAN", "VLX", "IDS", "SCAN2PC", "TAVIK_LIGHT", "MAA",
+                                                 "PJL",     "DCU", "AMPV", "ND",     "OTHERS"};
+
+namespace {
+
+constexpr U8 ESC = 0x1B;
+constexpr S32 kSignatureSize = 10;
+constexpr S32 kAppHeaderSize = 16;
+
+// What sets the four application packets apart. Byte 7 of the signature is
+// the application; the rest is shared.
+struct AppKind {
+    const char *tag;       // log tag, e.g. "DCU"
+    const char *appType;   // application type handed to Java
+    const char *function;  // the checker's name, for its log lines
+    U8 signatureByte7;
+    bool hasBody;          // false: header only (AMPV)
+    bool emptyBodyAllowed; // length 0 sends the header alone (ND, FAXD)
+    S32 unreadableAnswer;  // answer when the body cannot be taken
+    const char *lengthFormat;
+};
+
+const AppKind kDCU{"DCU", "dcu", "USBADP_CheckDCUApp", 0x07, true, false, -2,
+                   "[USBAdp] [DCU] DCU Packet length: %d\n"};
+const AppKind kAMPV{"AMPV", "ampv", "USBADP_CheckAMPVApp", 0x06, false, false, -2, nullptr};
+const AppKind kND{"ND", "networkrds", "USBADP_CheckNDApp", 0x0D, true, true, 0,
+                  "[USBAdp] [ND] ND Sub Request  length: %d\n"};
+const AppKind kFAXD{"FAXD", "faxd", "USBADP_CheckFAXDApp", 0x0E, true, true, 0,
+                    "[USBAdp] [FAXD] FAXD Sub Request length: %d\n"};
+
+// The body cannot be had once the host is gone or the channel is being closed;
+// without this a silent host would hold the reader for ever.
+bool channelGone() { return IsDisconnected.load() || hibernation_flag.load(); }
+
+// Reads the whole body. False on a read error or when the channel goes away.
+bool readBody(const AppKind &k, U8 *body, S32 len) {
+    S32 got = 0;
+    while (got < len) {
+        ssize_t n = ::read(fdPrn.load(), body + got, static_cast<size_t>(len - got));
+        int err = n < 0 ? errno : 0;
+        char line[96];
+        std::snprintf(line, sizeof line, "[USBAdp] [%s] read bytes from %s App, slRet: %%d\n", k.tag, k.tag);
+        USBADP_LOG(DEBUG, line, static_cast<int>(n));
+        if (n < 0 && err == EINTR) continue;
+        if (n < 0 || (n == 0 && channelGone())) {
+            std::snprintf(line, sizeof line,
+                          "[USBAdp] [%s] Error in reading from fdPrn, sl%sXMLPacketLen: %%d, errno: %%d\n", k.tag,
+                          k.tag);
+            USBADP_LOG(ERROR, line, len, err);
+            return false;
+        }
+        // A read of 0 is the driver's time-out: the host may still send.
+        got += static_cast<S32>(n);
+    }
+    return true;
+}
+
+void logWithTag(const AppKind &k, const char *format) {
+    char line[128];
+    std::snprintf(line, sizeof line, format, k.tag, k.tag);
+    USBADP_LOG(ERROR, "%s", line);
+}
+
+S32 checkApp(const AppKind &k, U8 *hdr) {
+    char line[128];
+    std::snprintf(line, sizeof line, "[USBAdp] [%s] Start %s()\n", k.tag, k.function);
+    USBADP_LOG(INFO, "%s", line);
+
+    U8 signature[kSignatureSize] = {ESC, 0x91, 0, 0, 0, 0, 0, k.signatureByte7, 0, 0};
+    if (std::memcmp(hdr, signature, kSignatureSize) != 0) {
+        std::snprintf(line, sizeof line, "[USBAdp] [%s] pubCommand[%%d]: %%#x\n", k.tag);
+        for (int i = 0; i < kSignatureSize; ++i) USBADP_LOG(DEBUG, line, i, hdr[i]);
+        return 0;
+    }
+    if (k.emptyBodyAllowed) {
+        std::snprintf(line, sizeof line, "[USBAdp] [%s] %s packet\n", k.tag, k.tag);
+        USBADP_LOG(INFO, "%s", line);
+    }
+
+    S32 len = 0;
+    std::unique_ptr<U8, decltype(&std::free)> body(nullptr, &std::free);
+    if (k.hasBody) {
+        len = static_cast<S32>(ReadBE32(hdr + 12));
+        USBADP_LOG(INFO, k.lengthFormat, len);
+        if (len <= 0 && !k.emptyBodyAllowed) {
+            std::snprintf(line, sizeof line, "[USBAdp] [%s] sl%sPacketLen[%%d] <= 0\n", k.tag, k.tag);
+            USBADP_LOG(ERROR, line, len);
+            return -2;
+        }
+        if (len < 0) {
+            // Not a length a host can mean; the header goes on as print data.
+            std::snprintf(line, sizeof line, "[USBAdp] [%s] invalid length: %%d\n", k.tag);
+            USBADP_LOG(ERROR, line, len);
+            return k.unreadableAnswer;
+        }
+        if (len > 0) {
+            body.reset(static_cast<U8 *>(std::malloc(static_cast<size_t>(len))));
+            if (!body) {
+                std::snprintf(line, sizeof line, "[USBAdp] [%s] Error in malloc for %sBuffer, len: %%d, errno: %%d\n",
+                              k.tag, k.tag);
+                USBADP_LOG(ERROR, line, len, errno);
+                return k.unreadableAnswer;
+            }
+            if (!readBody(k, body.get(), len)) return k.unreadableAnswer;
+        }
+    }
+
+    // Drop a stream left over from a transfer that failed half-way.
+    ClearAppStream();
+    const TPrintDelivery &d = USBPrint_Delivery();
+    if (d.SendAppType(k.appType) < 0) {
+        logWithTag(k, "[USBAdp] [%s] Error in Sending %s AppType\n");
+        return -2;
+    }
+    if (d.SendAppBuf(k.appType, hdr, kAppHeaderSize) < 0) {
+        logWithTag(k, "[USBAdp] [%s] Error in sending %s Header\n");
+        return -2;
+    }
+    if (len > 0 && d.SendAppBuf(k.appType, body.get(), len) < 0) {
+        logWithTag(k, k.emptyBodyAllowed ? "[USBAdp] [%s] Error in sending %s Sub Request packet\n"
+                                         : "[USBAdp] [%s] Error in sending %s packet\n");
+        return -2;
+    }
+    if (d.NotifyAppEnd(k.appType) < 0) {
+        logWithTag(k, "[USBAdp] [%s] Error in Notify End of %s job\n");
+        return -2;
+    }
+    std::snprintf(line, sizeof line, "[USBAdp] [%s] Exit %s()\n", k.tag, k.function);
+    USBADP_LOG(INFO, "%s", line);
+    return 1;
+}
+
+TUSBAdp_ParserID classOf(const U8 *pubCommand) {
+    if (pubCommand[0] != ESC) return enOther;
+    switch (pubCommand[1]) {
+    case 0x24: return enVLX_PARSER;
+    case 0x25: return enPJL_PARSER;
+    case 0x77: return enMAA_PARSER;
+    case 0x91: return enIDS_PARSER;
+    case 0x9A: return enS2A_PARSER;
+    case 0xA8: return enPCSCAN_PARSER;
+    case 0xAA: return enTAVIK_LIGHT_PARSER;
+    default: return enOther;
+    }
+}
+
+// ESC 0x91 streams: a capability/IDS query, or one of the four application
+// packets that share the selector, or else print data.
+S32 classifyIds(U8 *pubCommand, U8 *pubfirmware_command, S32 *slfirmRes) {
+    U8 aubBuf[kAppHeaderSize] = {};
+    aubBuf[0] = pubCommand[0];
+    aubBuf[1] = pubCommand[1];
+    // One read; a short header is not completed.
+    if (::read(fdPrn.load(), aubBuf + 2, VLX_HEADER - 2) < 0) {
+        USBADP_LOG(ERROR, "[USBAdp] Error in reading IDS header, errno: %d\n", errno);
+        return -2;
+    }
+    ulDrvHandle = static_cast<U32>(fdPrn.load());
+    // The header is taken as 16 bytes whatever was read: make the part that was
+    // not read zero rather than left-overs of an earlier stream.
+    std::memset(pubfirmware_command, 0, kAppHeaderSize);
+    S32 slRet = Vlx_Cap_Xml(fdPrn.load(), aubBuf, VLX_HEADER, pubfirmware_command);
+    if (slRet == 0) {
+        USBADP_LOG(INFO, "[USBAdp] IDS execution is success\n");
+        return 0;
+    }
+    USBADP_LOG(INFO, "[USBAdp] Not IDS parser, check for AMPV/DCU having same initial 2bytes, slRet: %ld\n",
+               static_cast<long>(slRet));
+    std::memcpy(aubBuf, pubfirmware_command, kAppHeaderSize);
+
+    struct {
+        S32 (*check)(U8 *);
+        const char *done;
+        const char *failed;
+    } const checkers[] = {
+        {USBADP_CheckDCUApp, "[USBAdp] DCU packet\n", "[USBAdp] Error in sending DCU packet\n"},
+        {USBADP_CheckAMPVApp, "[USBAdp] AMPV packet\n", "[USBAdp] Error in sending AMPV packet\n"},
+        {USBADP_CheckNDApp, "[USBAdp] ND packet\n", "[USBAdp] Error in sending ND packet\n"},
+        {USBADP_CheckFAXDApp, "[USBAdp] FAXD packet\n", "[USBAdp] Error in sending FAXD packet\n"},
+    };
+    for (const auto &c : checkers) {
+        S32 r = c.check(aubBuf);
+        if (r == 1) {
+            USBADP_LOG(INFO, "%s", c.done);
+            return 0;
+        }
+        if (r == -2) {
+            USBADP_LOG(ERROR, "%s", c.failed);
+            return -2;
+        }
+    }
+    std::memcpy(pubfirmware_command, aubBuf, kAppHeaderSize);
+    *slfirmRes = kAppHeaderSize;
+    return -1;
+}
+
+}  // namespace
+
+S32 USBADP_CheckDCUApp(U8 *hdr) { return checkApp(kDCU, hdr); }
+S32 USBADP_CheckAMPVApp(U8 *hdr) { return checkApp(kAMPV, hdr); }
+S32 USBADP_CheckNDApp(U8 *hdr) { return checkApp(kND, hdr); }
+S32 USBADP_CheckFAXDApp(U8 *hdr) { return checkApp(kFAXD, hdr); }
+
+S32 USBAdpater_StartDataClassifier(U8 *pubCommand, U8 *pubfirmware_command, S32 *slfirmRes,
+                                   TUSBAdp_ParserID *enParserID) {
+    USBADP_LOG(DEBUG, "[USBAdp] USBAdpater_StartDataClassifier Begin\n");
+    const S32 slInitialBytes = 2;
+    S32 slRet = -1;
+
+    const TUSBAdp_ParserID id = classOf(pubCommand);
+    switch (id) {
+    case enVLX_PARSER:
+        slDeviceHndl = fdPrn.load();
+        slRet = USBAdpScan_VLX(pubCommand);
+        break;
+    case enMAA_PARSER: slRet = MAA_Hook(static_cast<U32>(fdPrn.load()), pubCommand); break;
+    case enIDS_PARSER: slDeviceHndl = fdPrn.load(); break;
+    case enS2A_PARSER:
+        slDeviceHndl = fdPrn.load();
+        USBAdpScan_Scan2App(pubCommand);
+        break;
+    case enPCSCAN_PARSER:
+        slDeviceHndl = fdPrn.load();
+        slRet = USBAdpScan_PCScan(pubCommand);
+        break;
+    case enTAVIK_LIGHT_PARSER:
+        slDeviceHndl = fdPrn.load();
+        USBAdpScan_TAVIK_Light(pubCommand);
+        break;
+    default: break;
+    }
+    *enParserID = id;
+    USBADP_LOG(INFO, "[USBAdp] Hostapp Type[%d]: %s\n", static_cast<int>(id), aubHostApp[id]);
+
+    switch (id) {
+    case enMAA_PARSER:
+        if (slRet > 0) {
+            // The hand-back never exceeds the command buffer.
+            if (slRet > COMMAND_SIZE - slInitialBytes) slRet = COMMAND_SIZE - slInitialBytes;
+            USBADP_LOG(INFO, "[USBAdp] Not MAA packet: %d\n", slRet + slInitialBytes);
+            std::memcpy(pubfirmware_command, pubCommand, static_cast<size_t>(slRet + slInitialBytes));
+            *slfirmRes = slRet + slInitialBytes;
+            return -1;
+        }
+        if (slRet == -1) {
+            USBADP_LOG(ERROR, "[USBAdp] MAA - No Data read\n");
+            return -2;
+        }
+        if (slRet == 0) USBADP_LOG(INFO, "[USBAdp] MAACommand executed\n");
+        USBADP_LOG(DEBUG, "[USBAdp] USBAdpater_StartDataClassifier End\n");
+        return 0;
+
+    case enIDS_PARSER: return classifyIds(pubCommand, pubfirmware_command, slfirmRes);
+
+    case enPJL_PARSER: {
+        S32 isFirmware = 0;
+        *slfirmRes = FirmWareDownload(fdPrn.load(), pubCommand, static_cast<U32>(slInitialBytes), pubfirmware_command,
+                                      &isFirmware);
+        if (isFirmware == 1 && *slfirmRes == 0) {
+            USBADP_LOG(INFO, "[USBAdp] Firmware download success\n");
+            return 0;
+        }
+        if (*slfirmRes == -1) {
+            USBADP_LOG(ERROR, "[USBAdp] Firmware download failed\n");
+            return -2;
+        }
+        USBADP_LOG(INFO, "[USBAdp] Bytes read in FirmWareDownload: %ld\n", static_cast<long>(*slfirmRes));
+        return -1;
+    }
+
+    case enVLX_PARSER:
+        if (slRet == 0)
+            USBADP_LOG(INFO, "[USBAdp] VLX executed successfully\n");
+        else
+            USBADP_LOG(ERROR, "[USBAdp] VLX failed to execute\n");
+        return 0;
+
+    case enPCSCAN_PARSER:
+        if (slRet == PCSCAN_FAIL) {
+            USBADP_LOG(ERROR, "[USBAdp] PCSCAN operation failed\n");
+            return -2;
+        }
+        return 0;
+
+    case enS2A_PARSER:
+    case enTAVIK_LIGHT_PARSER: return 0;
+
+    default:
+        USBADP_LOG(INFO, "[USBAdp] Host print job without PJL command\n");
+        std::memcpy(pubfirmware_command, pubCommand, static_cast<size_t>(slInitialBytes));
+        *slfirmRes = slInitialBytes;
+        return -1;
+    }
+}
+
+S32 CheckUELCommand(U8 *buffer, S32 size) {
+    USBADP_LOG(DEBUG, "[USBAdp]Inside CheckUELCommand:::: size is [%d]\n", size);
+    S32 i = 0;
+    while (i < size) {
+        if (buffer[i] != ESC) {
+            const void *next = std::memchr(buffer + i, ESC, static_cast<size_t>(size - i));
+            if (!next) {
+                i = size;
+                break;
+            }
+            i = static_cast<S32>(static_cast<const U8 *>(next) - buffer);
+        }
+        UelPosition = i;
+        bool whole = true;
+        for (S32 j = 1; j < UEL_PATTERN_SIZE; ++j) {
+            if (i == size - 1) {
+                // The buffer ends inside the pattern: j of its bytes are here.
+                splitPatternMarker = j;
+                splitPatternFlag = 1;
+                USBADP_LOG(DEBUG, "[USBAdp]splitPatternMarker : [%d]\n", splitPatternMarker);
+                USBADP_LOG(DEBUG, "[USBAdp]returning false\n");
+                return 0;
+            }
+            ++i;
+            if (buffer[i] != UELPattern[j]) {
+                whole = false;
+                break;
+            }
+        }
+        if (whole) {
+            ++jobCounter;
+            USBADP_LOG(DEBUG, "[USBAdp]return TRUE HITT jobCounter[%d]\n", jobCounter);
+            USBADP_LOG(DEBUG, "[USBAdp]return TRUE HITT UelPosition[%d]\n", UelPosition);
+            return 1;
+        }
+        // The mismatching byte is looked at again: it may start a UEL itself.
+    }
+    USBADP_LOG(DEBUG, "[USBAdp]return FALSE :: Exiting with i [%d]\n", i);
+    return 0;
+}

@@ -1,0 +1,125 @@
+// The print side started as the Java service starts it: queues, readPrintMsg
+// on a thread of its own that never returns, initDevice, and the bridge's
+// "configured" notification on the emulated print node.
+#pragma once
+
+#include <sys/msg.h>
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <fstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "Fixtures.h"
+#include "JvmHarness.h"
+#include "LoggerHost.h"
+#include "support/MsgQueue.h"
+#include "support/TempRoot.h"
+#include "usbadapter/mfpbridge.h"
+#include "vdev.h"
+
+namespace printjvm {
+
+inline const std::string kUel = "\x1b%-12345X";
+inline constexpr const char *kReadPrintMsgSig =
+    "(Ljava/lang/Object;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;I)V";
+
+template <typename Pred>
+bool WaitUntil(Pred pred, int ms = 10000) {
+    auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);
+    while (!pred()) {
+        if (std::chrono::steady_clock::now() > end) return false;
+        std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    }
+    return true;
+}
+
+// Calls readPrintMsg on `daemon` on the calling thread; null texts pass null.
+inline void ReadPrintMsg(JNIEnv *env, jobject daemon, jobject maa, const char *manufacturer, const char *model,
+                         const char *deviceClass, jint fax = 1) {
+    jclass cls = jvm::Class(jvm::kPrintAndScanService);
+    jmethodID mid = env->GetMethodID(cls, "readPrintMsg", kReadPrintMsgSig);
+    ASSERT_NE(mid, nullptr);
+    jstring m = jvm::Str(env, manufacturer), p = jvm::Str(env, model), c = jvm::Str(env, deviceClass);
+    env->CallVoidMethod(daemon, mid, maa, m, p, c, fax);
+    std::string ex = jvm::TakeException(env);
+    EXPECT_EQ(ex, "") << "readPrintMsg threw";
+    for (jstring s : {m, p, c})
+        if (s) env->DeleteLocalRef(s);
+}
+
+inline mfp_notif_t Notification(U8 code) {
+    mfp_notif_t n{};
+    n.ub_notif = code;
+    n.ub_intf = eMfp_Notif_Prn;
+    return n;
+}
+
+// Waits until `job` holds `bytes` bytes.
+inline bool AwaitJobBytes(int job, long long bytes, int ms = 10000) {
+    return WaitUntil([&] { return fixtures::JobCount() > job && fixtures::JobByteCount(job) == bytes; }, ms);
+}
+
+}  // namespace printjvm
+
+class PrintJvmTest : public ::testing::Test {
+protected:
+    static constexpr const char *kKeyFile = "/halvard/spool/tmp/testfile";
+
+    void SetUp() override {
+        vdev::Reset();
+        LoggerHost_StartCapture();
+        fixtures::Reset();
+        // A reused inode gives the same key: drop queues a crashed run left.
+        std::ofstream(root_ / kKeyFile).flush();
+        RemoveQueues();
+    }
+    void TearDown() override { RemoveQueues(); }
+
+    int QueueOf(int proj) const {
+        key_t key = ftok((root_ / kKeyFile).c_str(), proj);
+        return key == -1 ? -1 : msgget(key, 0);
+    }
+    void RemoveQueues() const {
+        RemoveQueue(QueueOf(5));
+        RemoveQueue(QueueOf(6));
+    }
+
+    // Queues created through `daemon` (it is a service object), then the reader
+    // started on its own thread. With `configure` the print node is set up and
+    // the host configures the device, so the reader is polling on return.
+    void StartReader(const char *daemonClass = fixtures::kRecordingDaemon, bool configure = true) {
+        daemon_ = jvm::New(daemonClass);
+        maa_ = jvm::New(fixtures::kRecordingMaa);
+        ASSERT_NE(daemon_, nullptr);
+        JNIEnv *env = jvm::Env();
+        jstring model = jvm::Str(env, "TW-4020 MFP");
+        jvm::CallVoid(daemon_, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", model);
+        env->DeleteLocalRef(model);
+        ASSERT_GE(QueueOf(5), 0);
+        jobject daemon = daemon_, maa = maa_;
+        jvm::StartDetached(
+            [daemon, maa](JNIEnv *e) { printjvm::ReadPrintMsg(e, daemon, maa, "Tarnwel", "TW-4020 MFP", "printer"); },
+            "print-reader");
+        if (!configure) {
+            ASSERT_TRUE(printjvm::WaitUntil([] { return LoggerHost_Contains("[USBAdp]Inside USBAdapter_IF_PrintFunction"); }));
+            return;
+        }
+        jvm::CallVoid(daemon_, "initDevice", "()V");
+        ASSERT_TRUE(printjvm::WaitUntil([] { return LoggerHost_Contains("[USBAdp]Exited Initialization(), fdPrn:"); }));
+        ASSERT_TRUE(vdev::AsyncEnabled(vdev::kPrn));
+        vdev::QueueNotification(vdev::kPrn, printjvm::Notification(MFP_DEV_CONFIGURED));
+        ASSERT_TRUE(printjvm::WaitUntil([] { return vdev::PollTimeouts(vdev::kPrn).size() >= 1; }));
+    }
+
+    // The host's silence: the reader's waiting poll times out now. Call it when
+    // the reader has delivered everything it was sent.
+    static void Silence() { vdev::ExpirePoll(vdev::kPrn); }
+
+    TempRoot root_;
+    jobject daemon_ = nullptr;
+    jobject maa_ = nullptr;
+};

@@ -1,0 +1,256 @@
+// Job framing: the reader's turns over host transfers, seen as the jobs Java
+// would get. The first rule everywhere: every byte the host sent as print data
+// is passed exactly once, in order.
+#include <cstring>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "print/PrintRecorder.h"
+
+namespace {
+
+using Framing = ReaderTest;
+
+std::string Framed(const std::string &payload) { return kUel + payload + kUel; }
+
+// Host data the classifier must not take for an application: escapes are
+// followed only by '%', another escape or 'E'; partial and spoiled UELs included.
+std::string NoisyPayload(size_t size, unsigned seed) {
+    static const std::string pieces[] = {"\x1b%-1234", "\x1b\x1b", "\x1b%-12345Y", "\x1b" "E", "\x1b%",
+                                         "@PJL SET COPIES=2\r\n", "page text "};
+    std::mt19937 rng(seed);
+    std::string out;
+    while (out.size() < size) {
+        if (rng() % 3 == 0) out += pieces[rng() % std::size(pieces)];
+        else out += static_cast<char>('a' + rng() % 26);
+    }
+    out.resize(size);
+    while (!out.empty() && out.back() == '\x1b') out.back() = 'z';
+    return out;
+}
+
+// Cuts `stream` at the given offsets into host transfers.
+std::vector<std::string> CutAt(const std::string &stream, const std::vector<size_t> &cuts) {
+    std::vector<std::string> out;
+    size_t from = 0;
+    for (size_t c : cuts) {
+        out.push_back(stream.substr(from, c - from));
+        from = c;
+    }
+    out.push_back(stream.substr(from));
+    return out;
+}
+
+void ExpectJobs(const std::vector<std::string> &expected) {
+    auto jobs = rec::Jobs();
+    ASSERT_EQ(jobs.size(), expected.size());
+    for (size_t i = 0; i < jobs.size(); ++i) {
+        EXPECT_EQ(jobs[i].bytes, expected[i]) << "job " << i;
+        EXPECT_TRUE(jobs[i].ended) << "job " << i;
+    }
+}
+
+// ---- single cases ----------------------------------------------------------
+
+TEST_F(Framing, UelFramedJobInOneReadIsOneJobOfOnePass) {
+    const std::string job = Framed("@PJL ENTER LANGUAGE=PCL\r\n" + std::string(200, 'x'));
+    Send({job});
+    ASSERT_EQ(rec::Events().size(), 3u);
+    EXPECT_EQ(rec::Events()[0].kind, rec::Kind::Register);
+    EXPECT_EQ(rec::Events()[1].kind, rec::Kind::Pass);
+    EXPECT_EQ(rec::Events()[1].data, job);
+    EXPECT_EQ(rec::Events()[2].kind, rec::Kind::End);
+    // Back to the short wait after the closing UEL.
+    EXPECT_EQ(vdev::PollTimeouts(vdev::kPrn), (std::vector<int>{5000, 5000, 5000}));
+    EXPECT_EQ(LoggerHost_Count("[USBAdp]NotifyEndOfData() called -- 4\n"), 1);
+}
+
+TEST_F(Framing, OpenUelJobWaitsFiveMinutesAndSilenceEndsIt) {
+    const std::string job = kUel + "@PJL\r\n" + std::string(100, 'y');
+    Send({job}, false);
+    ASSERT_EQ(rec::Jobs().size(), 1u);
+    EXPECT_FALSE(rec::Jobs()[0].ended);
+    Silence();
+    Silence();
+    ExpectJobs({job});
+    EXPECT_EQ(vdev::PollTimeouts(vdev::kPrn), (std::vector<int>{5000, 5000, 300000, 5000}));
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] Print channel poll timeout updated to 5sec\n"), 1);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp]NotifyEndOfData() called -- 2\n"), 1);
+}
+
+TEST_F(Framing, HeldUelBytesBecomeAJobOfTheirOwnAfterSilence) {
+    for (size_t k = 1; k <= 8; ++k) {
+        SCOPED_TRACE(k);
+        rec::Clear();
+        ResetReader();
+        LoggerHost_StartCapture();
+        Send({Framed("A") + kUel.substr(0, k)});
+        ExpectJobs({Framed("A"), kUel.substr(0, k)});
+        EXPECT_EQ(LoggerHost_Count("[USBAdp] Going to call RegisterJob...New Job Created! 1\n"), 1);
+    }
+}
+
+TEST_F(Framing, HeldUelBytesOfAnOpenJobStayInItWhenSilenceEndsIt) {
+    Send({"plain page data\x1b%-12"});
+    ExpectJobs({"plain page data\x1b%-12"});
+    EXPECT_EQ(LoggerHost_Count("[USBAdp]Held UEL bytes passed at end of job: [5]\n"), 1);
+}
+
+TEST_F(Framing, UelLastInTheReadOpensTheJobInsteadOfEndingIt) {
+    Send({"lead-in" + kUel}, false);
+    ASSERT_EQ(rec::Jobs().size(), 1u);
+    EXPECT_FALSE(rec::Jobs()[0].ended);
+    Send({"body" + kUel}, false);
+    ExpectJobs({"lead-in" + kUel + "body" + kUel});
+}
+
+TEST_F(Framing, ShortPjlPrefixIsDeliveredWithoutAFurtherRead) {
+    const std::string first = kUel + "@PJL\r\n";
+    vdev::HostWrite(vdev::kPrn, first);
+    vdev::HostWrite(vdev::kPrn, "more data");
+    USBAdapter_ReadPass();
+    EXPECT_EQ(vdev::ReadSizes(vdev::kPrn), (std::vector<size_t>{2, 78}));
+    EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 9u);
+    auto jobs = rec::Jobs();
+    ASSERT_EQ(jobs.size(), 1u);
+    EXPECT_EQ(jobs[0].chunks, (std::vector<size_t>{first.size()}));
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] Data less than 80bytes: 15\n"), 1);
+}
+
+TEST_F(Framing, SingleByteTransfersAreNotLost) {
+    Send({"Z"});
+    ExpectJobs({"Z"});
+    rec::Clear();
+    Send({"Y", "ab", "c"});
+    ExpectJobs({"Yabc"});
+}
+
+TEST_F(Framing, RefusedJobDropsItsChunkAndTheNextChunkTriesAgain) {
+    rec::RegisterAnswer() = -1;
+    Send({"dropped"}, false);
+    EXPECT_EQ(rec::Delivered(), "");
+    EXPECT_EQ(LoggerHost_Count("[USBAdp]returning back\n"), 1);
+    rec::RegisterAnswer() = 1;
+    Send({"kept"});
+    ExpectJobs({"kept"});
+
+    // The same with framed jobs: the refused job's UEL is not counted for the next.
+    rec::Clear();
+    rec::RegisterAnswer() = -1;
+    Send({Framed("refused")}, false);
+    rec::RegisterAnswer() = 1;
+    Send({Framed("accepted")});
+    ExpectJobs({Framed("accepted")});
+}
+
+TEST_F(Framing, HostApplicationBetweenJobsIsNotPrintData) {
+    // An ND packet of header only, between two print jobs.
+    std::string nd = {'\x1b', '\x91', 0, 0, 0, 0, 0, 0x0D, 0, 0, 0, 0, 0, 0, 0, 0};
+    Send({Framed("one"), nd, Framed("two")});
+    ExpectJobs({Framed("one"), Framed("two")});
+    auto apps = rec::Apps();
+    ASSERT_EQ(apps.size(), 1u);
+    EXPECT_EQ(apps[0].writes, (std::vector<std::string>{nd}));
+}
+
+// ---- matrices: every cut ---------------------------------------------------
+
+TEST_F(Framing, FramedJobsSurviveEveryCutIntoTwoAndThreeTransfers) {
+    const std::vector<std::string> payloads = {NoisyPayload(23, 1), "", NoisyPayload(31, 2)};
+    std::string stream;
+    std::vector<std::string> expected;
+    for (const std::string &p : payloads) {
+        expected.push_back(Framed(p));
+        stream += expected.back();
+    }
+    LoggerHost_StopCapture();
+    for (size_t c1 = 1; c1 < stream.size(); ++c1) {
+        for (size_t c2 = c1; c2 < stream.size(); ++c2) {
+            SCOPED_TRACE(testing::Message() << "cuts " << c1 << ", " << c2);
+            rec::Clear();
+            ResetReader();
+            Send(c1 == c2 ? CutAt(stream, {c1}) : CutAt(stream, {c1, c2}));
+            ExpectJobs(expected);
+            if (HasFailure()) return;
+        }
+    }
+}
+
+TEST_F(Framing, LooseStreamsPassEveryByteOnceWhereverTheyAreCut) {
+    const std::vector<std::string> streams = {
+        "lead" + kUel + kUel + NoisyPayload(20, 3) + kUel + "trail\x1b%-12",
+        NoisyPayload(30, 4) + kUel + NoisyPayload(10, 5),
+        kUel + "a" + kUel + "b" + kUel + "c" + kUel + kUel,
+        "\x1b%-12345Y\x1b%-1234" + kUel + "\x1b\x1b%-12345X",
+    };
+    LoggerHost_StopCapture();
+    for (const std::string &stream : streams) {
+        for (size_t c1 = 1; c1 < stream.size(); ++c1) {
+            for (size_t c2 = c1; c2 < stream.size(); c2 += 3) {
+                SCOPED_TRACE(testing::Message() << "stream of " << stream.size() << ", cuts " << c1 << ", " << c2);
+                rec::Clear();
+                ResetReader();
+                Send(c1 == c2 ? CutAt(stream, {c1}) : CutAt(stream, {c1, c2}));
+                EXPECT_EQ(rec::Delivered(), stream);
+                for (const rec::Job &j : rec::Jobs()) EXPECT_TRUE(j.ended);
+                if (HasFailure()) return;
+            }
+        }
+    }
+}
+
+// ---- large jobs --------------------------------------------------------------
+
+std::string RandomBytes(size_t size, uint64_t seed) {
+    std::mt19937_64 rng(seed);
+    std::string out(size, '\0');
+    for (size_t i = 0; i + 8 <= size; i += 8) {
+        uint64_t v = rng();
+        std::memcpy(&out[i], &v, 8);
+    }
+    return out;
+}
+
+// Transfers of `size`; a transfer never starts with an escape, which would
+// make the classifier look for a host application there.
+std::vector<std::string> Transfers(const std::string &stream, size_t size) {
+    std::vector<std::string> out;
+    for (size_t at = 0; at < stream.size(); at += size) {
+        out.push_back(stream.substr(at, size));
+        if (at > 0 && out.back()[0] == '\x1b') out.back()[0] = 'A';
+    }
+    return out;
+}
+
+std::string Join(const std::vector<std::string> &parts) {
+    std::string all;
+    for (const std::string &p : parts) all += p;
+    return all;
+}
+
+TEST_F(Framing, FortyMebibyteJobInMebibyteTransfersArrivesWhole) {
+    LoggerHost_StopCapture();
+    auto transfers = Transfers(Framed(RandomBytes((40u << 20) - 18, 42)), 1u << 20);
+    const std::string stream = Join(transfers);
+    Send(transfers);
+    auto jobs = rec::Jobs();
+    ASSERT_EQ(jobs.size(), 1u);
+    EXPECT_TRUE(jobs[0].bytes == stream) << "delivered " << jobs[0].bytes.size() << " of " << stream.size();
+    EXPECT_TRUE(jobs[0].ended);
+    EXPECT_EQ(jobs[0].chunks.size(), 40u);
+}
+
+TEST_F(Framing, UnframedLargeJobWithOddTransferSizesArrivesWhole) {
+    LoggerHost_StopCapture();
+    auto transfers = Transfers(RandomBytes(9u << 20, 7), (1u << 20) - 3);
+    transfers.push_back("\x1b");  // ends in a held escape
+    const std::string stream = Join(transfers);
+    Send(transfers);
+    auto jobs = rec::Jobs();
+    ASSERT_EQ(jobs.size(), 1u);
+    EXPECT_TRUE(jobs[0].bytes == stream) << "delivered " << jobs[0].bytes.size() << " of " << stream.size();
+    EXPECT_TRUE(jobs[0].ended);
+}
+
+}  // namespace
