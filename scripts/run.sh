@@ -1,10 +1,20 @@
 #!/usr/bin/env bash
-# Builds the library and plays a session on the virtual devices.
+# Builds the library and the simulator, then plays a host session: the library
+# inside a JVM with the reference print service, on virtual devices.
+#   scripts/run.sh                 the sample session (tools/sim/samples/session.sim)
+#   scripts/run.sh ARGS...         usbadapter-sim with these arguments (files, -s, -e, ...)
 set -euo pipefail
 cd "$(dirname "$0")/.."
 cmake --preset default >/dev/null
-cmake --build --preset default --target usbadapter usbadapter-bridge-demo >/dev/null
+cmake --build --preset default --target usbadapter usbadapter-sim >/dev/null
 echo "== exported entries of libusbadapter.so"
 nm -D --defined-only build/default/src/libusbadapter.so | awk '{print "  " $3}'
-echo "== bridge session on the virtual devices"
-USBADAPTER_LOG_LEVEL=${USBADAPTER_LOG_LEVEL:-OFF} build/default/tools/sim/usbadapter-bridge-demo
+out=build/default/sim-out
+args=("$@")
+((${#args[@]})) || args=(--script tools/sim/samples/session.sim)
+echo "== usbadapter-sim ${args[*]}"
+status=0
+build/default/tools/sim/usbadapter-sim --out "$out" "${args[@]}" || status=$?
+echo "== session journal ($out/session.jsonl)"
+cat "$out/session.jsonl"
+exit "$status"

@@ -1,0 +1,213 @@
+// Print throughput through the whole print path: host transfers on the
+// emulated print node, the library's reader (classification, UEL framing) and
+// PassData into a Java job handler that copies each buffer, in a real JVM
+// (without -Xcheck:jni, as in production). Baseline in the same run: the same
+// transfers through the bare emulated channel (the scan node), read by a
+// native thread with the reader's poll-and-read of up to 1 MiB.
+//
+// One iteration is one UEL-framed job of kJobSize bytes, timed from the first
+// host write until the reader has taken every byte and waits for the host
+// again (every up-call of the job has returned by then).
+#include <benchmark/benchmark.h>
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/ipc.h>
+#include <sys/msg.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "Data.h"
+#include "Host.h"
+#include "Jvm.h"
+#include "LoggerHost.h"
+#include "RatioReporter.h"
+#include "vdev.h"
+
+namespace {
+
+constexpr size_t kJobSize = 32 << 20;
+constexpr size_t kReadSize = 1 << 20;  // the reader's RX_BUFFER_SIZE
+constexpr const char *kDaemon = "com/tarnwel/vbk/ca/plugin/usbadapter/print/USBPrintDaemon";
+constexpr const char *kMaa = "com/tarnwel/vbk/ca/plugin/usbadapter/print/USBMaaService";
+
+std::string gRoot;
+sim::ServiceThread gReader;
+std::atomic<size_t> gBareRead{0};
+std::string gJob;
+
+[[noreturn]] void Fail(const std::string &why) {
+    std::fprintf(stderr, "print_throughput: %s\n", why.c_str());
+    std::fflush(nullptr);
+    _exit(1);
+}
+
+void RemoveQueues() {
+    for (int project : {5, 6}) {
+        key_t key = ftok((gRoot + "/halvard/spool/tmp/testfile").c_str(), project);
+        int q = key == -1 ? -1 : msgget(key, 0);
+        if (q >= 0) msgctl(q, IPC_RMID, nullptr);
+    }
+}
+
+// The service's start-up on the plain print daemon, then the host configures
+// the device; returns when the reader polls the print node.
+void StartService() {
+    char tmpl[] = "/tmp/usbadapter-bench-XXXXXX";
+    if (!::mkdtemp(tmpl)) Fail("no temporary directory");
+    gRoot = tmpl;
+    std::filesystem::create_directories(gRoot + "/halvard/sys/statusinfo");
+    std::filesystem::create_directories(gRoot + "/halvard/spool/tmp");
+    ::setenv("USBADAPTER_ROOT", gRoot.c_str(), 1);
+
+    sim::JvmConfig config = sim::DefaultJvmConfig();
+    config.checkJni = false;
+    config.maxHeap = "1g";
+    std::string error;
+    if (!sim::CreateJvm(config, &error)) Fail(error);
+    JNIEnv *env = sim::Env();
+    jobject daemon = sim::NewObject(env, kDaemon, &error);
+    jobject maa = daemon ? sim::NewObject(env, kMaa, &error) : nullptr;
+    if (!maa) Fail(error);
+    jstring model = env->NewStringUTF("Bench MFP");
+    if (!sim::CallVoid(env, daemon, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", &error, model) ||
+        !sim::CallVoid(env, daemon, "initDevice", "()V", &error))
+        Fail(error);
+    env->DeleteLocalRef(model);
+    sim::StartServiceThread(gReader, "usbadapter-print", [daemon, maa](JNIEnv *penv) {
+        jclass cls = penv->GetObjectClass(daemon);
+        jmethodID read = penv->GetMethodID(
+            cls, "readPrintMsg", "(Ljava/lang/Object;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;I)V");
+        penv->DeleteLocalRef(cls);
+        if (read)
+            penv->CallVoidMethod(daemon, read, maa, penv->NewStringUTF("Tarnwel"), penv->NewStringUTF("Bench MFP"),
+                                 penv->NewStringUTF("PRINTER"), 1);
+    });
+    if (!sim::WaitUntil([] { return vdev::AsyncEnabled(vdev::kPrn) && gReader.tid > 0; }, 10000))
+        Fail("the print reader did not set up the print node");
+    if (!sim::NotifyAndWait(vdev::kPrn, MFP_DEV_CONFIGURED, eMfp_Notif_Both, 10000) ||
+        !sim::WaitUntil([] { return sim::PollCount(vdev::kPrn) > 0; }, 10000))
+        Fail("the print reader did not start reading");
+}
+
+// The bare channel's reader: poll and read, as the library's reader does.
+void StartBareReader() {
+    int fd = ::open(vdev::kScan, O_RDWR);
+    if (fd < 0) Fail("cannot open the scan node");
+    std::thread([fd] {
+        std::vector<char> buf(kReadSize);
+        for (;;) {
+            pollfd p{fd, POLLIN, 0};
+            if (::poll(&p, 1, -1) <= 0) continue;
+            ssize_t n = ::read(fd, buf.data(), buf.size());
+            if (n > 0) gBareRead.fetch_add(static_cast<size_t>(n), std::memory_order_release);
+        }
+    }).detach();
+}
+
+std::string MakeJob() {
+    const std::string head = std::string(sim::kUel) + "@PJL ENTER LANGUAGE=PCL\r\n";
+    std::string job = head;
+    unsigned x = 7;
+    job.reserve(kJobSize);
+    while (job.size() < kJobSize - sim::kUel.size()) {
+        x = x * 1103515245u + 12345u;
+        char c = static_cast<char>(x >> 23);
+        job.push_back(c == '\x1b' ? 'E' : c);
+    }
+    return job + std::string(sim::kUel);
+}
+
+// Host writes of the job in transfers of `size`; returns when `done` holds,
+// polled every 100 us (both paths alike). Seconds.
+template <typename Done>
+double SendJob(const char *path, size_t size, Done done) {
+    const auto start = std::chrono::steady_clock::now();
+    for (size_t off = 0; off < gJob.size(); off += size)
+        vdev::HostWrite(path, gJob.data() + off, std::min(size, gJob.size() - off));
+    const auto deadline = start + std::chrono::seconds(60);
+    while (!done()) {
+        if (std::chrono::steady_clock::now() > deadline) Fail("a job did not get through within 60 s");
+        std::this_thread::sleep_for(std::chrono::microseconds(100));
+    }
+    return std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+}
+
+// One small job with the library's log captured: the handler was made, every
+// chunk passed and nothing was refused. Otherwise the figures would measure a
+// path that drops the data.
+void CheckPrintPath() {
+    const std::string job = std::string(sim::kUel) + "@PJL ENTER LANGUAGE=PCL\r\nsanity" + std::string(sim::kUel);
+    const pid_t reader = gReader.tid;
+    LoggerHost_StartCapture();
+    vdev::HostWrite(vdev::kPrn, job.data(), job.size());
+    bool idle = sim::WaitUntil([reader] {
+        return vdev::PendingHostBytes(vdev::kPrn) == 0 && sim::ProbeThread(reader) == sim::ThreadWait::Poll;
+    }, 10000);
+    LoggerHost_StopCapture();
+    int errors = 0;
+    for (const LoggedLine &l : LoggerHost_Captured()) errors += l.level >= 40000;
+    if (!idle || LoggerHost_Count("[USBAdp] Inside RegisterJob().\n") != 1 ||
+        LoggerHost_Contains("globalUSBPrintFileStreamObj") || errors != 0)
+        Fail("the print path does not deliver a job to Java: see the library log (USBADAPTER_LOG_LEVEL=DEBUG)");
+}
+
+void BM_PrintPath(benchmark::State &state) {
+    const size_t size = static_cast<size_t>(state.range(0));
+    const pid_t reader = gReader.tid;
+    for (auto _ : state) {
+        state.SetIterationTime(SendJob(vdev::kPrn, size, [reader] {
+            return vdev::PendingHostBytes(vdev::kPrn) == 0 && sim::ProbeThread(reader) == sim::ThreadWait::Poll;
+        }));
+        if (gReader.returned) Fail("the print reader returned: " + gReader.exception);
+    }
+    state.SetBytesProcessed(static_cast<int64_t>(state.iterations()) * static_cast<int64_t>(gJob.size()));
+}
+
+void BM_BareChannel(benchmark::State &state) {
+    const size_t size = static_cast<size_t>(state.range(0));
+    for (auto _ : state) {
+        const size_t target = gBareRead.load() + gJob.size();
+        state.SetIterationTime(SendJob(vdev::kScan, size, [target] { return gBareRead.load() >= target; }));
+    }
+    state.SetBytesProcessed(static_cast<int64_t>(state.iterations()) * static_cast<int64_t>(gJob.size()));
+}
+
+const int64_t kTransferSizes[] = {4 << 10, 64 << 10, 1 << 20};
+
+}  // namespace
+
+int main(int argc, char **argv) {
+    setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
+    benchmark::Initialize(&argc, argv);
+    if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
+    gJob = MakeJob();
+    StartService();
+    StartBareReader();
+    CheckPrintPath();
+
+    RatioReporter reporter;
+    for (int64_t size : kTransferSizes) {
+        benchmark::RegisterBenchmark("BM_BareChannel", BM_BareChannel)->Arg(size)->UseManualTime()->MinTime(1.0)
+            ->Unit(benchmark::kMillisecond);
+        benchmark::RegisterBenchmark("BM_PrintPath", BM_PrintPath)->Arg(size)->UseManualTime()->MinTime(1.0)
+            ->Unit(benchmark::kMillisecond);
+        const std::string suffix = "/" + std::to_string(size) + "/min_time:1.000/manual_time";
+        reporter.Compare("BM_PrintPath" + suffix, "BM_BareChannel" + suffix);
+    }
+    benchmark::RunSpecifiedBenchmarks(&reporter);
+    reporter.PrintRatios();
+    benchmark::Shutdown();
+    RemoveQueues();
+    std::error_code ec;
+    std::filesystem::remove_all(gRoot, ec);
+    std::fflush(nullptr);
+    _exit(0);  // the print reader never returns
+}

@@ -1,0 +1,348 @@
+// usbadapter-sim as a black box: each test writes a script and its data files,
+// runs the simulator on them and checks what came out: the exit status, the
+// session journal and the job files the Java side wrote. The simulator's own
+// output is echoed so that JNI complaints fail the test.
+#include <fcntl.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <random>
+#include <regex>
+#include <sstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "Sha256.h"
+
+extern char **environ;
+
+namespace {
+
+namespace fs = std::filesystem;
+
+const std::string kUel = "\x1b%-12345X";
+
+std::string ReadFile(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    std::ostringstream all;
+    all << in.rdbuf();
+    return all.str();
+}
+
+void WriteFile(const std::string &path, const std::string &bytes) {
+    std::ofstream(path, std::ios::binary) << bytes;
+}
+
+// Print data as a driver makes it: no ESC, so no stray selector or UEL.
+std::string PrintData(size_t n, unsigned seed) {
+    std::mt19937 gen(seed);
+    std::string s(n, '\0');
+    for (char &c : s) {
+        c = static_cast<char>(gen() & 0xFF);
+        if (c == '\x1b') c = 'E';
+    }
+    return s;
+}
+
+std::string UelJob(const std::string &body) { return kUel + "@PJL ENTER LANGUAGE=PCL\r\n" + body + kUel; }
+
+// A string or number field of one journal line ("" when absent).
+std::string Field(const std::string &line, const std::string &key) {
+    std::smatch m;
+    std::regex re("\"" + key + "\":(\"([^\"]*)\"|(-?[0-9]+|true|false))");
+    if (!std::regex_search(line, m, re)) return {};
+    return m[2].matched ? m[2].str() : m[3].str();
+}
+
+struct Event {
+    std::string src, event, line;
+    std::string operator[](const std::string &key) const { return Field(line, key); }
+};
+
+class Simulator : public ::testing::Test {
+protected:
+    void SetUp() override {
+        char tmpl[] = "/tmp/usbadapter-e2e-XXXXXX";
+        ASSERT_NE(::mkdtemp(tmpl), nullptr);
+        dir_ = tmpl;
+    }
+    void TearDown() override {
+        std::error_code ec;
+        if (!HasFailure()) fs::remove_all(dir_, ec);
+    }
+
+    std::string Path(const std::string &name) const { return dir_ + "/" + name; }
+    std::string Out(const std::string &name) const { return dir_ + "/out/" + name; }
+
+    // Runs the simulator with `args` (after the output directory option);
+    // returns its exit status, -1 when it had to be killed.
+    int Run(std::vector<std::string> args) {
+        args.insert(args.begin(), {USBADAPTER_SIM, "--out", dir_ + "/out", "--timeout", "8000"});
+        std::vector<char *> argv;
+        for (auto &a : args) argv.push_back(a.data());
+        argv.push_back(nullptr);
+        posix_spawn_file_actions_t actions;
+        posix_spawn_file_actions_init(&actions);
+        const std::string log = Path("sim-output.txt");
+        posix_spawn_file_actions_addopen(&actions, 1, log.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+        posix_spawn_file_actions_adddup2(&actions, 1, 2);
+        pid_t pid = -1;
+        int rc = posix_spawn(&pid, argv[0], &actions, nullptr, argv.data(), environ);
+        posix_spawn_file_actions_destroy(&actions);
+        if (rc != 0) {
+            ADD_FAILURE() << "cannot start " << argv[0];
+            return -1;
+        }
+        int status = 0;
+        auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(45);
+        while (waitpid(pid, &status, WNOHANG) == 0) {
+            if (std::chrono::steady_clock::now() > deadline) {
+                kill(pid, SIGKILL);
+                waitpid(pid, &status, 0);
+                ADD_FAILURE() << "the simulator did not finish";
+                return -1;
+            }
+            std::this_thread::sleep_for(std::chrono::milliseconds(20));
+        }
+        output_ = ReadFile(log);
+        std::fputs(output_.c_str(), stdout);
+        return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    }
+
+    int RunScript(const std::string &script, std::vector<std::string> extra = {}) {
+        WriteFile(Path("session.sim"), script);
+        extra.insert(extra.begin(), {"--script", Path("session.sim")});
+        return Run(extra);
+    }
+
+    std::vector<Event> Journal() const {
+        std::vector<Event> events;
+        std::istringstream in(ReadFile(Out("session.jsonl")));
+        for (std::string line; std::getline(in, line);)
+            events.push_back({Field(line, "src"), Field(line, "event"), line});
+        return events;
+    }
+    std::vector<Event> Events(const std::string &src, const std::string &event) const {
+        std::vector<Event> out;
+        for (const Event &e : Journal())
+            if (e.src == src && e.event == event) out.push_back(e);
+        return out;
+    }
+    // Position of the first matching event in the journal, -1 when absent.
+    int IndexOf(const std::string &src, const std::string &event, int from = 0) const {
+        std::vector<Event> all = Journal();
+        for (int i = from; i < static_cast<int>(all.size()); ++i)
+            if (all[i].src == src && all[i].event == event) return i;
+        return -1;
+    }
+
+    std::string dir_;
+    std::string output_;
+};
+
+TEST_F(Simulator, UelFramedJobArrivesAsOneJobEndedByItsClosingUel) {
+    const std::string job = UelJob(PrintData(20000, 1));
+    WriteFile(Path("job.prn"), job);
+
+    ASSERT_EQ(RunScript("send prn file:job.prn\nexpect-jobs 1\n"), 0);
+
+    auto ends = Events("java", "job-end");
+    ASSERT_EQ(ends.size(), 1u);
+    EXPECT_EQ(ends[0]["bytes"], std::to_string(job.size()));
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
+    EXPECT_EQ(Events("java", "job-start").size(), 1u);
+    // The closing UEL ended it: the host never had to stay silent.
+    EXPECT_TRUE(Events("host", "silence").empty());
+    EXPECT_EQ(Events("sim", "end").at(0)["status"], "passed");
+}
+
+TEST_F(Simulator, JobSplitAcrossTransfersIsReassembledWhereverTheCutsFall) {
+    const std::string job = UelJob(PrintData(3000, 2));
+    WriteFile(Path("job.prn"), job);
+    // Cuts inside the opening UEL, inside the body and inside the closing UEL.
+    const size_t closing = job.size() - kUel.size();
+    const std::string chunks = "1,3,5,100," + std::to_string(closing - 109 - 4) + ",4,2";
+
+    ASSERT_EQ(RunScript("send prn file:job.prn chunks " + chunks + "\nexpect-jobs 1\n"), 0);
+
+    auto sends = Events("host", "send");
+    ASSERT_EQ(sends.size(), 1u);
+    EXPECT_EQ(sends[0]["transfers"], "8");
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
+    EXPECT_EQ(Events("java", "job-end").size(), 1u);
+}
+
+TEST_F(Simulator, TwoJobsInOneTransferAreCutAtTheirUels) {
+    const std::string first = UelJob(PrintData(700, 3)), second = UelJob(PrintData(900, 4));
+    WriteFile(Path("both.prn"), first + second);
+
+    ASSERT_EQ(RunScript("send prn file:both.prn\nexpect-jobs 2\n"), 0);
+
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), first);
+    EXPECT_EQ(ReadFile(Out("job-002.prn")), second);
+    EXPECT_EQ(Events("java", "job-start").size(), 2u);
+}
+
+TEST_F(Simulator, JobWithoutUelEndsOnlyWhenTheHostStaysSilent) {
+    const std::string data = PrintData(6000, 5);
+    WriteFile(Path("raw.prn"), data);
+
+    ASSERT_EQ(RunScript("send prn file:raw.prn\nwait-idle\nexpect-jobs 0\nsilence prn\nexpect-jobs 1\n"), 0);
+
+    int silence = IndexOf("host", "silence");
+    int end = IndexOf("java", "job-end");
+    ASSERT_GE(silence, 0);
+    EXPECT_GT(end, silence);
+    EXPECT_LT(IndexOf("java", "job-start"), silence);  // the job was open while the host sent
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), data);
+}
+
+TEST_F(Simulator, Sha256OfAJobOverSeveralReadsEqualsWhatTheHostSent) {
+    // Larger than one 1 MiB read of the reader.
+    const std::string job = UelJob(PrintData(2600000, 6));
+    WriteFile(Path("big.prn"), job);
+
+    ASSERT_EQ(RunScript("send prn file:big.prn every 65536\nexpect-jobs 1\n"), 0);
+
+    const std::string sha = sim::Sha256Hex(job);
+    auto sends = Events("host", "send");
+    auto ends = Events("java", "job-end");
+    ASSERT_EQ(sends.size(), 1u);
+    ASSERT_EQ(ends.size(), 1u);
+    EXPECT_EQ(sends[0]["sha256"], sha);
+    EXPECT_EQ(ends[0]["sha256"], sha);
+    EXPECT_EQ(ends[0]["bytes"], std::to_string(job.size()));
+    EXPECT_EQ(sim::Sha256Hex(ReadFile(Out("job-001.prn"))), sha);
+}
+
+TEST_F(Simulator, FailedExpectationStopsTheSessionWithStatusOne) {
+    WriteFile(Path("one.prn"), UelJob("x"));
+
+    EXPECT_EQ(RunScript("send prn file:one.prn\nexpect-jobs 2\nnote not reached\n"), 1);
+
+    auto expects = Events("sim", "expect");
+    ASSERT_EQ(expects.size(), 1u);
+    EXPECT_EQ(expects[0]["ok"], "false");
+    EXPECT_EQ(expects[0]["got"], "1");
+    auto errors = Events("sim", "error");
+    ASSERT_EQ(errors.size(), 1u);
+    EXPECT_NE(errors[0]["where"].find("session.sim:2"), std::string::npos);
+    EXPECT_TRUE(Events("sim", "note").empty());
+    EXPECT_EQ(Events("sim", "end").at(0)["status"], "failed");
+    EXPECT_NE(output_.find("session FAILED"), std::string::npos);
+}
+
+TEST_F(Simulator, ScriptErrorsAreRefusedBeforeTheSessionStarts) {
+    EXPECT_EQ(RunScript("send prn uel\nsend prn hex:1b2\n"), 2);
+    EXPECT_NE(output_.find("session.sim:2"), std::string::npos);
+    EXPECT_EQ(RunScript("plug\nsendd prn uel\n"), 2);
+    EXPECT_NE(output_.find("unknown command 'sendd'"), std::string::npos);
+    EXPECT_FALSE(fs::exists(Out("journal.jsonl")));
+}
+
+TEST_F(Simulator, FilesOnTheCommandLineAreSentAsOneJobEach) {
+    const std::string a = UelJob(PrintData(1000, 7));
+    const std::string b = PrintData(1500, 8);  // no UEL: ended by silence
+    WriteFile(Path("a.prn"), a);
+    WriteFile(Path("b.prn"), b);
+
+    ASSERT_EQ(Run({Path("a.prn"), Path("b.prn")}), 0);
+
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), a);
+    EXPECT_EQ(ReadFile(Out("job-002.prn")), b);
+    EXPECT_NE(output_.find("job-001.prn  = a.prn"), std::string::npos);
+    EXPECT_NE(output_.find("job-002.prn  = b.prn"), std::string::npos);
+}
+
+TEST_F(Simulator, WithoutArgumentsTheBuiltInSampleIsOneUelFramedJob) {
+    ASSERT_EQ(Run({}), 0);
+
+    const std::string job = ReadFile(Out("job-001.prn"));
+    ASSERT_GT(job.size(), 2 * kUel.size());
+    EXPECT_EQ(job.substr(0, kUel.size()), kUel);
+    EXPECT_EQ(job.substr(job.size() - kUel.size()), kUel);
+    EXPECT_NE(job.find("@PJL"), std::string::npos);
+    EXPECT_EQ(Events("java", "job-end").size(), 1u);
+    EXPECT_FALSE(fs::exists(Out("job-002.prn")));
+}
+
+TEST_F(Simulator, PulledCableEndsTheOpenJobAndAReplugReadsAgain) {
+    const std::string partial = kUel + PrintData(800, 9);  // the closing UEL never comes
+    const std::string next = UelJob(PrintData(500, 10));
+    WriteFile(Path("partial.prn"), partial);
+    WriteFile(Path("next.prn"), next);
+
+    ASSERT_EQ(RunScript("send prn file:partial.prn\nwait-idle\nexpect-jobs 0\nunplug\nexpect-jobs 1\n"
+                        "plug\nsend prn file:next.prn\nexpect-jobs 2\n"),
+              0);
+
+    EXPECT_GT(IndexOf("java", "job-end"), IndexOf("host", "unplug"));
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), partial);
+    EXPECT_EQ(ReadFile(Out("job-002.prn")), next);
+}
+
+TEST_F(Simulator, DataSentBeforeTheHostConfiguresTheDeviceIsReadAfterwards) {
+    const std::string job = UelJob(PrintData(4000, 11));
+    WriteFile(Path("early.prn"), job);
+
+    ASSERT_EQ(RunScript("send prn file:early.prn\nexpect-jobs 0\nplug\nexpect-jobs 1\n", {"--no-plug"}), 0);
+
+    EXPECT_LT(IndexOf("host", "plug"), IndexOf("java", "job-start"));
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
+    auto steps = Events("sim", "startup");
+    ASSERT_GE(steps.size(), 3u);
+    EXPECT_EQ(steps[0]["step"], "creatPrnScanMsgQs");
+    EXPECT_EQ(steps[1]["step"], "initDevice");
+    EXPECT_EQ(steps[2]["step"], "readPrintMsg");
+}
+
+TEST_F(Simulator, JournalNumbersEveryLineAndMergesEveryJavaLine) {
+    WriteFile(Path("a.prn"), UelJob(PrintData(300, 12)) + UelJob(PrintData(200, 13)));
+
+    ASSERT_EQ(RunScript("send prn file:a.prn\nexpect-jobs 2\nread prn\n"), 0);
+
+    std::vector<Event> all = Journal();
+    ASSERT_FALSE(all.empty());
+    std::vector<std::string> merged;
+    for (size_t i = 0; i < all.size(); ++i) {
+        EXPECT_EQ(all[i]["seq"], std::to_string(i + 1));
+        EXPECT_TRUE(all[i].src == "host" || all[i].src == "java" || all[i].src == "sim") << all[i].line;
+        EXPECT_EQ(all[i].line.front(), '{');
+        EXPECT_EQ(all[i].line.back(), '}');
+        if (all[i].src == "java") merged.push_back(all[i].line.substr(all[i].line.find("\"event\"")));
+    }
+    std::vector<std::string> java;
+    std::istringstream in(ReadFile(Out("journal.jsonl")));
+    for (std::string line; std::getline(in, line);) java.push_back(line.substr(1));
+    EXPECT_EQ(merged, java);
+    EXPECT_EQ(Events("host", "read").at(0)["bytes"], "0");
+    EXPECT_EQ(all.back().event, "end");
+}
+
+TEST_F(Simulator, JobContentOrReadBackOtherThanExpectedFails) {
+    WriteFile(Path("job.prn"), UelJob("abc"));
+    WriteFile(Path("other.prn"), UelJob("abd"));
+
+    EXPECT_EQ(RunScript("send prn file:job.prn\nexpect-job 1 equals file:other.prn\n"), 1);
+    EXPECT_EQ(Events("sim", "expect").at(0)["ok"], "false");
+
+    EXPECT_EQ(RunScript("set timeout 300\nexpect-read prn hex:41\n"), 1);
+    auto reads = Events("host", "read");
+    ASSERT_EQ(reads.size(), 1u);
+    EXPECT_EQ(reads[0]["bytes"], "0");
+    EXPECT_EQ(Events("sim", "expect").at(0)["ok"], "false");
+
+    EXPECT_EQ(RunScript("send prn file:missing.prn\n"), 1);
+    EXPECT_NE(output_.find("cannot read"), std::string::npos);
+}
+
+}  // namespace

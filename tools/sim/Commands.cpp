@@ -1,0 +1,522 @@
+// The script commands. Every wait is bounded by the session's time-out and
+// watches the library's own progress: vdev's records of host transfers and
+// polls, the reader thread's blocking call, the Java side's journal.
+#include <cstdlib>
+#include <fstream>
+#include <sstream>
+#include <thread>
+
+#include "Data.h"
+#include "Host.h"
+#include "Script.h"
+#include "Sha256.h"
+#include "usbadapter/mfpbridge.h"
+#include "vdev.h"
+
+namespace sim {
+namespace {
+
+// ---- helpers ------------------------------------------------------------------
+
+const char *ChannelPath(const std::string &name) {
+    if (name == "prn") return vdev::kPrn;
+    if (name == "scan") return vdev::kScan;
+    return nullptr;
+}
+
+bool CheckChannel(const std::string &name, std::string *error) {
+    if (ChannelPath(name)) return true;
+    *error = "unknown channel '" + name + "' (prn or scan)";
+    return false;
+}
+
+// The channel a reader of this session serves; others have nobody to wait for.
+bool CheckReaderChannel(const std::string &name, std::string *error) {
+    if (!CheckChannel(name, error)) return false;
+    if (name == "prn") return true;
+    *error = "no reader runs on the " + name + " channel in this session";
+    return false;
+}
+
+bool ParseCount(const std::string &text, long long *value, std::string *error) {
+    size_t v = 0;
+    if (!ParseSize(text, &v)) {
+        *error = "not a number: '" + text + "'";
+        return false;
+    }
+    *value = static_cast<long long>(v);
+    return true;
+}
+
+bool CheckDataItems(Args::const_iterator first, Args::const_iterator last, std::string *error) {
+    if (first == last) {
+        *error = "data expected (file:, hex:, text:, uel, sample, pattern:, fill:)";
+        return false;
+    }
+    for (auto it = first; it != last; ++it)
+        if (!CheckDataItem(*it, error)) return false;
+    return true;
+}
+
+bool Data(Session &s, Args::const_iterator first, Args::const_iterator last, std::string *bytes,
+          std::string *error) {
+    return BuildData(Args(first, last), s.baseDir, bytes, error);
+}
+
+bool ReadFileBytes(const std::string &path, std::string *out) {
+    std::ifstream in(path, std::ios::binary);
+    if (!in) return false;
+    std::ostringstream all;
+    all << in.rdbuf();
+    *out = all.str();
+    return true;
+}
+
+void JournalRead(Session &s, const std::string &chan, const std::vector<uint8_t> &got) {
+    std::string bytes(got.begin(), got.end());
+    s.bytesReadBack += bytes.size();
+    s.Host(
+        JsonLine("read").Str("chan", chan).Num("bytes", static_cast<long long>(bytes.size())).Str("hex", Hex(bytes)));
+}
+
+bool Expect(Session &s, JsonLine line, bool ok, const std::string &failure, std::string *error) {
+    s.Sim(line.Bool("ok", ok));
+    if (!ok) *error = failure;
+    return ok;
+}
+
+// One poll period without host data, delivered when the reader waits for the
+// host; done when it waits again (or has parked).
+bool SilenceOnce(Session &s, const char *path, std::string *error) {
+    if (!s.plugged) {
+        *error = "the device is not plugged in: the reader does not poll";
+        return false;
+    }
+    if (!s.WaitIdle(error)) return false;
+    const pid_t reader = s.printReader.tid;
+    const size_t polls = PollCount(path);
+    vdev::ExpirePoll(path, 1);
+    bool back = WaitUntil(
+        [&] {
+            if (s.ReaderGone()) return true;
+            if (PollCount(path) <= polls) return false;
+            return ReaderWaiting(reader, path) || ProbeThread(reader) == ThreadWait::Sleep;
+        },
+        s.timeoutMs);
+    if (!back) {
+        *error = "the print reader did not come back to wait for the host after a poll time-out";
+        return false;
+    }
+    return s.WaitIdle(error);
+}
+
+// ---- checks ----------------------------------------------------------------------
+
+bool CheckNumberArgs(const Args &a, std::string *error) {
+    long long v;
+    for (const auto &w : a)
+        if (!ParseCount(w, &v, error)) return false;
+    return true;
+}
+
+bool CheckChannelArg(const Args &a, std::string *error) {
+    if (!CheckChannel(a[0], error)) return false;
+    return a.size() < 2 || CheckNumberArgs(Args(a.begin() + 1, a.end()), error);
+}
+
+bool CheckSilence(const Args &a, std::string *error) {
+    if (!CheckReaderChannel(a[0], error)) return false;
+    return a.size() < 2 || CheckNumberArgs(Args(a.begin() + 1, a.end()), error);
+}
+
+// send CHAN DATA... [chunks N,M,...] [every N]
+struct SendArgs {
+    Args::const_iterator dataEnd;
+    std::vector<size_t> chunks;
+    size_t every = 0;
+};
+
+bool ParseSend(const Args &a, SendArgs *out, std::string *error) {
+    auto it = a.begin() + 1;
+    while (it != a.end() && *it != "chunks" && *it != "every") ++it;
+    out->dataEnd = it;
+    if (!CheckDataItems(a.begin() + 1, it, error)) return false;
+    while (it != a.end()) {
+        const std::string &key = *it++;
+        if (it == a.end()) {
+            *error = key + " needs a value";
+            return false;
+        }
+        const std::string &value = *it++;
+        if (key == "every") {
+            if (!ParseSize(value, &out->every) || out->every == 0) {
+                *error = "every: a size above 0 expected, not '" + value + "'";
+                return false;
+            }
+        } else if (key == "chunks") {
+            std::stringstream list(value);
+            for (std::string item; std::getline(list, item, ',');) {
+                size_t n = 0;
+                if (!ParseSize(item, &n)) {
+                    *error = "chunks: sizes separated by commas expected, not '" + value + "'";
+                    return false;
+                }
+                out->chunks.push_back(n);
+            }
+        } else {
+            *error = "unexpected '" + key + "' (chunks or every)";
+            return false;
+        }
+    }
+    return true;
+}
+
+bool CheckSend(const Args &a, std::string *error) {
+    if (!CheckChannel(a[0], error)) return false;
+    SendArgs parsed;
+    return ParseSend(a, &parsed, error);
+}
+
+bool CheckExpectRead(const Args &a, std::string *error) {
+    return CheckChannel(a[0], error) && CheckDataItems(a.begin() + 1, a.end(), error);
+}
+
+// expect-job K [bytes N] [sha256 HEX] [equals DATA...]
+bool CheckExpectJob(const Args &a, std::string *error) {
+    long long v;
+    if (!ParseCount(a[0], &v, error)) return false;
+    for (size_t i = 1; i < a.size(); i += 2) {
+        if (a[i] == "equals") return CheckDataItems(a.begin() + static_cast<long>(i) + 1, a.end(), error);
+        if (i + 1 >= a.size()) {
+            *error = a[i] + " needs a value";
+            return false;
+        }
+        if (a[i] == "bytes") {
+            if (!ParseCount(a[i + 1], &v, error)) return false;
+        } else if (a[i] != "sha256") {
+            *error = "unexpected '" + a[i] + "' (bytes, sha256 or equals)";
+            return false;
+        }
+    }
+    return true;
+}
+
+bool CheckNotify(const Args &a, std::string *error) {
+    static const char *const names[] = {"configured", "disconnect", "reset", "scan-command"};
+    bool known = false;
+    for (const char *n : names) known |= a[0] == n;
+    long long v;
+    if (!known && !ParseCount(a[0], &v, error)) {
+        *error = "notification: configured, disconnect, reset, scan-command or a number";
+        return false;
+    }
+    if (a.size() > 1 && a[1] != "prn" && a[1] != "scan" && a[1] != "both") {
+        *error = "for whom: prn, scan or both";
+        return false;
+    }
+    return true;
+}
+
+bool CheckSet(const Args &a, std::string *error) {
+    if (a[0] != "timeout") {
+        *error = "unknown setting '" + a[0] + "' (timeout)";
+        return false;
+    }
+    long long v;
+    return ParseCount(a[1], &v, error);
+}
+
+// ---- commands --------------------------------------------------------------------
+
+bool Plug(Session &s, const Args &, std::string *error) {
+    const bool was = s.plugged;
+    const size_t polls = PollCount(vdev::kPrn);
+    s.Host(JsonLine("plug"));
+    if (!NotifyAndWait(vdev::kPrn, MFP_DEV_CONFIGURED, eMfp_Notif_Both, s.timeoutMs)) {
+        *error = "the configured notification was not taken (is the print node set up for SIGIO?)";
+        return false;
+    }
+    s.plugged = s.everPlugged = true;
+    if (was) return true;
+    bool reading = WaitUntil([&] { return s.ReaderGone() || PollCount(vdev::kPrn) > polls; }, s.timeoutMs);
+    if (!reading || s.ReaderGone()) {
+        *error = s.ReaderGone() ? "the print reader returned" : "the print reader did not start reading";
+        return false;
+    }
+    return true;
+}
+
+bool Unplug(Session &s, const Args &, std::string *error) {
+    const bool wasReading = s.plugged;
+    s.Host(JsonLine("unplug"));
+    if (!NotifyAndWait(vdev::kPrn, MFP_DEV_DISCONNECT, eMfp_Notif_Both, s.timeoutMs)) {
+        *error = "the disconnect notification was not taken";
+        return false;
+    }
+    s.plugged = false;
+    if (!wasReading) return true;
+    // The reader parks when it next looks at the bridge state: at once if the
+    // signal interrupted its poll, otherwise when the poll ends, which a pulled
+    // cable makes happen now.
+    const pid_t reader = s.printReader.tid;
+    int expired = 0;
+    bool parked = WaitUntil(
+        [&] {
+            if (s.ReaderGone() || ProbeThread(reader) == ThreadWait::Sleep) return true;
+            if (expired < 2 && ReaderWaiting(reader, vdev::kPrn)) {
+                const size_t polls = PollCount(vdev::kPrn);
+                vdev::ExpirePoll(vdev::kPrn, 1);
+                ++expired;
+                WaitUntil([&] { return PollCount(vdev::kPrn) > polls || ProbeThread(reader) != ThreadWait::Poll; },
+                          s.timeoutMs);
+            }
+            return false;
+        },
+        s.timeoutMs);
+    if (!parked) {
+        *error = "the print reader did not stop reading after the cable was pulled";
+        return false;
+    }
+    s.SyncJava();
+    return true;
+}
+
+bool Notify(Session &s, const Args &a, std::string *error) {
+    int code;
+    if (a[0] == "configured") code = MFP_DEV_CONFIGURED;
+    else if (a[0] == "disconnect") code = MFP_DEV_DISCONNECT;
+    else if (a[0] == "reset") code = MFP_DEV_RESET;
+    else if (a[0] == "scan-command") code = SCAN_COMMAND;
+    else code = std::atoi(a[0].c_str());
+    int forWhom = eMfp_Notif_Both;
+    if (a.size() > 1) forWhom = a[1] == "prn" ? eMfp_Notif_Prn : a[1] == "scan" ? eMfp_Notif_Scan : eMfp_Notif_Both;
+    s.Host(JsonLine("notify").Num("code", code).Num("for", forWhom));
+    if (!NotifyAndWait(vdev::kPrn, static_cast<uint8_t>(code), forWhom, s.timeoutMs)) {
+        *error = "the notification was not taken";
+        return false;
+    }
+    return true;
+}
+
+bool Send(Session &s, const Args &a, std::string *error) {
+    SendArgs parsed;
+    if (!ParseSend(a, &parsed, error)) return false;
+    std::string bytes;
+    if (!Data(s, a.begin() + 1, parsed.dataEnd, &bytes, error)) return false;
+    std::vector<size_t> sizes = SplitTransfers(bytes.size(), parsed.chunks, parsed.every);
+    const char *path = ChannelPath(a[0]);
+    size_t offset = 0;
+    for (size_t n : sizes) {
+        vdev::HostWrite(path, bytes.data() + offset, n);
+        offset += n;
+    }
+    s.bytesSent += bytes.size();
+    s.transfersSent += sizes.size();
+    JsonLine line("send");
+    line.Str("chan", a[0]).Num("bytes", static_cast<long long>(bytes.size())).Num("transfers",
+                                                                                static_cast<long long>(sizes.size()));
+    if (sizes.size() <= 64) {
+        std::string list = "[";
+        for (size_t i = 0; i < sizes.size(); ++i) list += (i ? "," : "") + std::to_string(sizes[i]);
+        line.Raw("sizes", list + "]");
+    }
+    s.Host(line.Str("sha256", Sha256Hex(bytes)));
+    return true;
+}
+
+bool Silence(Session &s, const Args &a, std::string *error) {
+    long long count = 1;
+    if (a.size() > 1 && !ParseCount(a[1], &count, error)) return false;
+    const char *path = ChannelPath(a[0]);
+    for (long long i = 0; i < count; ++i) {
+        s.Host(JsonLine("silence").Str("chan", a[0]));
+        if (!SilenceOnce(s, path, error)) return false;
+    }
+    s.SyncJava();
+    return true;
+}
+
+bool EndJob(Session &s, const Args &, std::string *error) {
+    if (!s.WaitIdle(error)) return false;
+    s.SyncJava();
+    for (int i = 0; i < 3 && s.OpenJobs() > 0; ++i) {
+        s.Host(JsonLine("silence").Str("chan", "prn"));
+        if (!SilenceOnce(s, vdev::kPrn, error)) return false;
+        s.SyncJava();
+    }
+    if (s.OpenJobs() == 0) return true;
+    *error = "print job " + std::to_string(s.jobs.back().number) + " still open after 3 poll periods of silence";
+    return false;
+}
+
+bool WaitIdleCmd(Session &s, const Args &, std::string *error) {
+    if (!s.WaitIdle(error)) return false;
+    s.SyncJava();
+    return true;
+}
+
+bool Read(Session &s, const Args &a, std::string *error) {
+    const char *path = ChannelPath(a[0]);
+    long long min = 0;
+    if (a.size() > 1 && !ParseCount(a[1], &min, error)) return false;
+    std::vector<uint8_t> got;
+    if (min > 0) {
+        got = vdev::HostReadAtLeast(path, static_cast<size_t>(min), s.timeoutMs);
+    } else {
+        if (!s.WaitIdle(error)) return false;
+        got = vdev::HostRead(path);
+    }
+    JournalRead(s, a[0], got);
+    if (static_cast<long long>(got.size()) >= min) return true;
+    *error = "read " + std::to_string(got.size()) + " of at least " + std::to_string(min) + " bytes";
+    return false;
+}
+
+bool ExpectRead(Session &s, const Args &a, std::string *error) {
+    std::string want;
+    if (!Data(s, a.begin() + 1, a.end(), &want, error)) return false;
+    const char *path = ChannelPath(a[0]);
+    std::vector<uint8_t> raw;
+    if (want.empty()) {
+        if (!s.WaitIdle(error)) return false;
+        raw = vdev::HostRead(path);
+    } else {
+        raw = vdev::HostReadAtLeast(path, want.size(), s.timeoutMs);
+    }
+    JournalRead(s, a[0], raw);
+    std::string got(raw.begin(), raw.end());
+    return Expect(s,
+                  JsonLine("expect").Str("what", "read").Str("chan", a[0]).Str("want", Hex(want)).Str("got", Hex(got)),
+                  got == want, "read back " + Hex(got) + ", expected " + Hex(want), error);
+}
+
+bool ExpectJobs(Session &s, const Args &a, std::string *error) {
+    long long want = 0;
+    if (!ParseCount(a[0], &want, error) || !s.WaitIdle(error)) return false;
+    s.SyncJava();
+    int got = s.EndedJobs();
+    return Expect(s, JsonLine("expect").Str("what", "jobs").Num("want", want).Num("got", got).Num("open", s.OpenJobs()),
+                  got == want,
+                  std::to_string(got) + " print job(s) ended (" + std::to_string(s.OpenJobs()) + " open), expected " +
+                      std::to_string(want),
+                  error);
+}
+
+bool ExpectApps(Session &s, const Args &a, std::string *error) {
+    long long want = 0;
+    if (!ParseCount(a[0], &want, error) || !s.WaitIdle(error)) return false;
+    s.SyncJava();
+    int got = s.EndedApps();
+    return Expect(s, JsonLine("expect").Str("what", "apps").Num("want", want).Num("got", got), got == want,
+                  std::to_string(got) + " application transfer(s) ended, expected " + std::to_string(want), error);
+}
+
+bool ExpectJob(Session &s, const Args &a, std::string *error) {
+    long long number = 0;
+    if (!ParseCount(a[0], &number, error) || !s.WaitIdle(error)) return false;
+    s.SyncJava();
+    JsonLine line("expect");
+    line.Str("what", "job").Num("job", number);
+    if (number < 1 || number > static_cast<long long>(s.jobs.size()) || !s.jobs[number - 1].ended) {
+        return Expect(s, line, false, "print job " + a[0] + " has not ended", error);
+    }
+    const JobRecord &job = s.jobs[number - 1];
+    std::string failure;
+    for (size_t i = 1; i < a.size() && failure.empty(); i += 2) {
+        if (a[i] == "bytes") {
+            long long want = 0;
+            if (!ParseCount(a[i + 1], &want, error)) return false;
+            line.Num("want-bytes", want);
+            if (job.bytes != want)
+                failure = "job " + a[0] + " has " + std::to_string(job.bytes) + " bytes, expected " + a[i + 1];
+        } else if (a[i] == "sha256") {
+            line.Str("want-sha256", a[i + 1]);
+            if (job.sha256 != a[i + 1]) failure = "job " + a[0] + " has SHA-256 " + job.sha256;
+        } else if (a[i] == "equals") {
+            std::string want, file;
+            if (!Data(s, a.begin() + static_cast<long>(i) + 1, a.end(), &want, error)) return false;
+            const std::string wantSha = Sha256Hex(want);
+            line.Num("want-bytes", static_cast<long long>(want.size())).Str("want-sha256", wantSha);
+            if (job.bytes != static_cast<long long>(want.size()) || job.sha256 != wantSha) {
+                failure = "job " + a[0] + " (" + std::to_string(job.bytes) + " bytes, SHA-256 " + job.sha256 +
+                          ") differs from the expected " + std::to_string(want.size()) + " bytes (SHA-256 " +
+                          wantSha + ")";
+            } else if (!ReadFileBytes(s.outDir + "/" + job.file, &file) || file != want) {
+                failure = "job file " + job.file + " differs from the expected bytes";
+            }
+            break;
+        }
+    }
+    line.Num("bytes", job.bytes).Str("sha256", job.sha256);
+    return Expect(s, line, failure.empty(), failure, error);
+}
+
+bool Sleep(Session &s, const Args &a, std::string *error) {
+    long long ms = 0;
+    if (!ParseCount(a[0], &ms, error)) return false;
+    s.Host(JsonLine("sleep").Num("ms", ms));
+    std::this_thread::sleep_for(std::chrono::milliseconds(ms));
+    return true;
+}
+
+bool Set(Session &s, const Args &a, std::string *error) {
+    long long v = 0;
+    if (!ParseCount(a[1], &v, error)) return false;
+    s.timeoutMs = static_cast<int>(v);
+    s.Sim(JsonLine("set").Num("timeout", v));
+    return true;
+}
+
+bool Note(Session &s, const Args &a, std::string *) {
+    std::string text;
+    for (const auto &w : a) text += (text.empty() ? "" : " ") + w;
+    s.Sim(JsonLine("note").Str("text", text));
+    return true;
+}
+
+const std::vector<Command> kCommands = {
+    {"plug", "",
+     "the host configures the device (MFP_DEV_CONFIGURED); the first time, waits until the print reader reads", 0, 0,
+     nullptr, Plug},
+    {"unplug", "", "the cable is pulled (MFP_DEV_DISCONNECT); waits until the print reader has parked", 0, 0, nullptr,
+     Unplug},
+    {"notify", "CODE [prn|scan|both]",
+     "queues a bridge notification (configured, disconnect, reset, scan-command or a number; default both) and "
+     "waits until the library took it",
+     1, 2, CheckNotify, Notify},
+    {"send", "CHAN DATA... [chunks N,M,...] [every N]",
+     "host transfers on CHAN (prn or scan): the data cut at the given sizes, the rest in one transfer; or in "
+     "transfers of N bytes",
+     2, -1, CheckSend, Send},
+    {"silence", "CHAN [COUNT]", "the host stays silent for COUNT (default 1) poll periods of the reader", 1, 2,
+     CheckSilence, Silence},
+    {"end-job", "", "the host stays silent until the open print job has ended (at most 3 poll periods)", 0, 0, nullptr,
+     EndJob},
+    {"wait-idle", "", "waits until the print reader has taken everything and waits for the host", 0, 0, nullptr,
+     WaitIdleCmd},
+    {"read", "CHAN [MIN]",
+     "reads what the device wrote on CHAN (waits for at least MIN bytes, or for the reader to be idle) into the "
+     "journal",
+     1, 2, CheckChannelArg, Read},
+    {"expect-read", "CHAN DATA...", "reads back exactly DATA on CHAN", 2, -1, CheckExpectRead, ExpectRead},
+    {"expect-jobs", "N", "N print jobs have ended on the Java side", 1, 1, CheckNumberArgs, ExpectJobs},
+    {"expect-job", "K [bytes N] [sha256 HEX] [equals DATA...]",
+     "print job K (from 1) has ended with these properties; equals also compares the job file", 1, -1, CheckExpectJob,
+     ExpectJob},
+    {"expect-apps", "N", "N application transfers have ended on the Java side", 1, 1, CheckNumberArgs, ExpectApps},
+    {"sleep", "MS", "waits MS milliseconds of real time", 1, 1, CheckNumberArgs, Sleep},
+    {"set", "timeout MS", "bound of every later wait (default 10000)", 2, 2, CheckSet, Set},
+    {"note", "TEXT...", "writes TEXT into the journal", 0, -1, nullptr, Note},
+};
+
+}  // namespace
+
+const std::vector<Command> &Commands() { return kCommands; }
+
+const Command *FindCommand(const std::string &name) {
+    for (const Command &c : kCommands)
+        if (name == c.name) return &c;
+    return nullptr;
+}
+
+}  // namespace sim
