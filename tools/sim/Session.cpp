@@ -29,28 +29,17 @@ Record &Slot(std::vector<Record> &records, long long number) {
 
 }  // namespace
 
-// Jobs the service still holds as open (its private list, read under its
-// lock); -1 when it cannot be read.
+// Jobs the service still holds as open (their "job-end" line not yet written);
+// -1 when it cannot be asked.
 int Session::JavaOpenJobs() {
     jclass cls = env->GetObjectClass(service);
-    jfieldID field = env->GetFieldID(cls, "openJobs", "Ljava/util/List;");
+    jmethodID count = env->GetMethodID(cls, "openJobCount", "()I");
     env->DeleteLocalRef(cls);
-    if (!field) {
+    if (!count) {
         TakeException(env);
         return -1;
     }
-    int size = -1;
-    if (env->MonitorEnter(service) == JNI_OK) {
-        jobject list = env->GetObjectField(service, field);
-        if (list) {
-            jclass listCls = env->GetObjectClass(list);
-            jmethodID sizeOf = env->GetMethodID(listCls, "size", "()I");
-            if (sizeOf) size = env->CallIntMethod(list, sizeOf);
-            env->DeleteLocalRef(listCls);
-            env->DeleteLocalRef(list);
-        }
-        env->MonitorExit(service);
-    }
+    int size = env->CallIntMethod(service, count);
     if (!TakeException(env).empty()) return -1;
     return size;
 }

@@ -174,15 +174,23 @@ public class ReferencePrintService extends USBPrintDaemon {
         return call("maaEngMaaOpcodeFTCATest", command, super.maaEngMaaOpcodeFTCATest(command));
     }
 
-    /** Writes "job-end" for every job whose end the reader has marked. */
-    public void finishEndedJobs() {
-        List<FileJob> ended = new ArrayList<>();
-        synchronized (this) {
-            openJobs.removeIf(job -> job.isEndOfData() && ended.add(job));
-        }
-        for (FileJob job : ended) {
+    /**
+     * Writes "job-end" for every job whose end the reader has marked. Under the
+     * service's lock, so a job is never counted as ended before its line is out.
+     */
+    public synchronized void finishEndedJobs() {
+        openJobs.removeIf(job -> {
+            if (!job.isEndOfData()) {
+                return false;
+            }
             job.finish();
-        }
+            return true;
+        });
+    }
+
+    /** Jobs not yet finished ("job-end" not yet written). */
+    public synchronized int openJobCount() {
+        return openJobs.size();
     }
 
     private String call(String method, String arg, String reply) {
