@@ -7,6 +7,7 @@
 
 #include "common/Log.h"
 #include "maa/MAA_MM.h"
+#include "maa/MAA_Result.h"
 #include "maa/MAA_Symbol.h"
 
 TMAASpecialMode enSpecialMode = MAA_NORMAL_CMD;
@@ -27,6 +28,17 @@ void MAA_WriteResult(TMAAResult *pstMAAResult) {
 }
 
 void MAA_IF_WriteResult(TMAAResult *pstMAAResult) { MAA_WriteResult(pstMAAResult); }
+
+void MAA_IF_SkipResult(void) {
+    static TMAAResult stSkip;
+    stSkip = {MAA_RESULT_CONTINUE, 0, 0, nullptr};
+    USBADP_LOG(INFO, "\r\n[MAA]Skip response");
+    MAA_WriteResult(&stSkip);
+}
+
+void MAA_IF_WriteFile(const U8 *pubFileBuffer, U32 ulFileSize) { MAA_WriteFile(pubFileBuffer, ulFileSize); }
+
+void MAA_IF_FileEnd(void) { MAA_FileEnd(); }
 
 void *MAA_IF_HeapAlloc(U32 ulSize, U32 ulPool) { return MAA_HeapAlloc(ulSize, ulPool); }
 void MAA_IF_HeapFree(void *pvPtr, U32 ulPool) { MAA_HeapFree(pvPtr, ulPool); }

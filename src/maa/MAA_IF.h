@@ -18,6 +18,11 @@ void MAA_SetResultWriter(TMAAResultWriter pfnWriter);
 // Sends one result record to the host; nothing in the stored-command run modes.
 void MAA_WriteResult(TMAAResult *pstMAAResult);
 void MAA_IF_WriteResult(TMAAResult *pstMAAResult);
+// A record of three zeros (continue, result 0, no data).
+void MAA_IF_SkipResult(void);
+// A file to the host in a transfer frame, and the end-of-file marker.
+void MAA_IF_WriteFile(const U8 *pubFileBuffer, U32 ulFileSize);
+void MAA_IF_FileEnd(void);
 
 void *MAA_IF_HeapAlloc(U32 ulSize, U32 ulPool);
 void MAA_IF_HeapFree(void *pvPtr, U32 ulPool);

@@ -1,5 +1,7 @@
 #include "JvmHarness.h"
 
+#include "JvmHost.h"
+
 #include <gtest/gtest.h>
 
 #include <cstdarg>
@@ -13,62 +15,39 @@
 namespace jvm {
 namespace {
 
-// JNI_VERSION_10 is what JDK 17 offers at most.
-constexpr jint kJniVersion = JNI_VERSION_10;
-
-JavaVM *gVm = nullptr;
 std::once_flag gCreate;
 std::mutex gClassMutex;
 std::map<std::string, jclass> gClasses;
 
-std::vector<std::string> BuildOptions() {
-    std::vector<std::string> opts = {
-        "-Djava.class.path=" USBADAPTER_JAR ":" USBADAPTER_FIXTURES_JAR,
-        "-Djava.library.path=" USBADAPTER_LIBDIR,
-        "-Xcheck:jni",
-        "-Xmx256m",
-        "-Xshare:auto",
-        // Start-up time dominates a one-test process.
-        "-XX:+UseSerialGC",
-        "-XX:TieredStopAtLevel=1",
-    };
+jvmhost::JvmConfig Config() {
+    jvmhost::JvmConfig config;
+    config.classPath = USBADAPTER_JAR ":" USBADAPTER_FIXTURES_JAR;
+    config.libDir = USBADAPTER_LIBDIR;
+    // Start-up time dominates a one-test process.
+    config.extra = {"-XX:TieredStopAtLevel=1"};
     // Extra options for a debugging session, separated by blanks.
     if (const char *extra = std::getenv("USBADAPTER_TEST_JVM_OPTS")) {
         std::istringstream words(extra);
-        for (std::string w; words >> w;) opts.push_back(w);
+        for (std::string w; words >> w;) config.extra.push_back(w);
     }
-    return opts;
+    return config;
+}
+
+// No test can run without the JVM or with a thread that cannot attach.
+[[noreturn]] void Die(const std::string &why) {
+    std::fprintf(stderr, "%s\n", why.c_str());
+    std::fflush(nullptr);
+    std::_Exit(2);
 }
 
 void Create() {
-    std::vector<std::string> opts = BuildOptions();
-    std::vector<JavaVMOption> jopts(opts.size());
-    for (size_t i = 0; i < opts.size(); ++i) jopts[i].optionString = opts[i].data();
-    JavaVMInitArgs args{};
-    args.version = kJniVersion;
-    args.nOptions = static_cast<jint>(jopts.size());
-    args.options = jopts.data();
-    args.ignoreUnrecognized = JNI_FALSE;
-    JNIEnv *env = nullptr;
-    jint rc = JNI_CreateJavaVM(&gVm, reinterpret_cast<void **>(&env), &args);
-    if (rc != JNI_OK) {
-        std::fprintf(stderr, "JNI_CreateJavaVM failed: %d\n", rc);
-        std::fflush(nullptr);
-        std::_Exit(2);
-    }
+    std::string error;
+    if (!jvmhost::CreateJvm(Config(), &error)) Die(error);
 }
 
 JNIEnv *Attach(const char *threadName) {
-    JavaVMAttachArgs args{};
-    args.version = kJniVersion;
-    args.name = const_cast<char *>(threadName);
-    args.group = nullptr;
-    JNIEnv *env = nullptr;
-    if (Vm()->AttachCurrentThreadAsDaemon(reinterpret_cast<void **>(&env), &args) != JNI_OK) {
-        std::fprintf(stderr, "AttachCurrentThreadAsDaemon failed\n");
-        std::fflush(nullptr);
-        std::_Exit(2);
-    }
+    JNIEnv *env = jvmhost::Env(threadName);
+    if (!env) Die(std::string("cannot attach ") + threadName + " to the JVM");
     return env;
 }
 
@@ -80,38 +59,46 @@ bool FailOnException(JNIEnv *env, const char *what) {
     return true;
 }
 
-jmethodID InstanceMethod(JNIEnv *env, jobject obj, const char *name, const char *sig) {
-    jclass cls = env->GetObjectClass(obj);
-    jmethodID mid = env->GetMethodID(cls, name, sig);
-    env->DeleteLocalRef(cls);
+// Calls the method through `call` (env, method id); a missing method or a Java
+// exception becomes a test failure and the answer `failed`.
+template <typename R, typename Call>
+R CallChecked(JNIEnv *env, jmethodID mid, const char *name, const char *sig, R failed, Call call) {
     if (!mid) {
         TakeException(env);
         ADD_FAILURE() << "no method " << name << sig;
+        return failed;
     }
-    return mid;
+    R r = call(mid);
+    return FailOnException(env, name) ? failed : r;
 }
 
-jmethodID StaticMethod(JNIEnv *env, jclass cls, const char *name, const char *sig) {
-    if (!cls) return nullptr;
-    jmethodID mid = env->GetStaticMethodID(cls, name, sig);
-    if (!mid) {
-        TakeException(env);
-        ADD_FAILURE() << "no static method " << name << sig;
-    }
-    return mid;
+template <typename R, typename Call>
+R Instance(jobject obj, const char *name, const char *sig, R failed, Call call) {
+    JNIEnv *env = Env();
+    jclass cls = env->GetObjectClass(obj);
+    jmethodID mid = env->GetMethodID(cls, name, sig);
+    env->DeleteLocalRef(cls);
+    return CallChecked(env, mid, name, sig, failed, [&](jmethodID m) { return call(env, m); });
+}
+
+template <typename R, typename Call>
+R Static(const char *cls, const char *name, const char *sig, R failed, Call call) {
+    JNIEnv *env = Env();
+    jclass c = Class(cls);
+    if (!c) return failed;
+    jmethodID mid = env->GetStaticMethodID(c, name, sig);
+    return CallChecked(env, mid, name, sig, failed, [&](jmethodID m) { return call(env, c, m); });
 }
 
 }  // namespace
 
 JavaVM *Vm() {
     std::call_once(gCreate, Create);
-    return gVm;
+    return jvmhost::Vm();
 }
 
 JNIEnv *Env() {
-    JNIEnv *env = nullptr;
-    jint rc = Vm()->GetEnv(reinterpret_cast<void **>(&env), kJniVersion);
-    if (rc == JNI_OK) return env;
+    Vm();
     return Attach("native-test");
 }
 
@@ -183,142 +170,99 @@ jbyteArray ByteArray(JNIEnv *env, const std::string &bytes) {
     return a;
 }
 
-std::string TakeException(JNIEnv *env) {
-    jthrowable ex = env->ExceptionOccurred();
-    if (!ex) return {};
-    env->ExceptionClear();
-    std::string text = "(exception)";
-    jclass cls = env->GetObjectClass(ex);
-    jmethodID toString = env->GetMethodID(cls, "toString", "()Ljava/lang/String;");
-    if (toString) {
-        auto s = static_cast<jstring>(env->CallObjectMethod(ex, toString));
-        if (env->ExceptionCheck()) {
-            env->ExceptionClear();
-        } else if (s) {
-            text = Text(env, s);
-            env->DeleteLocalRef(s);
-        }
-    } else {
-        env->ExceptionClear();
-    }
-    env->DeleteLocalRef(cls);
-    env->DeleteLocalRef(ex);
-    return text;
-}
+std::string TakeException(JNIEnv *env) { return jvmhost::TakeException(env); }
 
 void CallVoid(jobject obj, const char *name, const char *sig, ...) {
-    JNIEnv *env = Env();
-    jmethodID mid = InstanceMethod(env, obj, name, sig);
-    if (!mid) return;
     va_list ap;
     va_start(ap, sig);
-    env->CallVoidMethodV(obj, mid, ap);
+    Instance(obj, name, sig, 0, [&](JNIEnv *e, jmethodID m) {
+        e->CallVoidMethodV(obj, m, ap);
+        return 0;
+    });
     va_end(ap);
-    FailOnException(env, name);
 }
 
 jint CallInt(jobject obj, const char *name, const char *sig, ...) {
-    JNIEnv *env = Env();
-    jmethodID mid = InstanceMethod(env, obj, name, sig);
-    if (!mid) return 0;
     va_list ap;
     va_start(ap, sig);
-    jint r = env->CallIntMethodV(obj, mid, ap);
+    jint r = Instance(obj, name, sig, jint{0}, [&](JNIEnv *e, jmethodID m) { return e->CallIntMethodV(obj, m, ap); });
     va_end(ap);
-    return FailOnException(env, name) ? 0 : r;
+    return r;
 }
 
 jobject CallObject(jobject obj, const char *name, const char *sig, ...) {
-    JNIEnv *env = Env();
-    jmethodID mid = InstanceMethod(env, obj, name, sig);
-    if (!mid) return nullptr;
     va_list ap;
     va_start(ap, sig);
-    jobject r = env->CallObjectMethodV(obj, mid, ap);
+    jobject r = Instance(obj, name, sig, jobject{},
+                         [&](JNIEnv *e, jmethodID m) { return e->CallObjectMethodV(obj, m, ap); });
     va_end(ap);
-    return FailOnException(env, name) ? nullptr : r;
+    return r;
 }
 
 void CallStaticVoid(const char *cls, const char *name, const char *sig, ...) {
-    JNIEnv *env = Env();
-    jclass c = Class(cls);
-    jmethodID mid = StaticMethod(env, c, name, sig);
-    if (!mid) return;
     va_list ap;
     va_start(ap, sig);
-    env->CallStaticVoidMethodV(c, mid, ap);
+    Static(cls, name, sig, 0, [&](JNIEnv *e, jclass c, jmethodID m) {
+        e->CallStaticVoidMethodV(c, m, ap);
+        return 0;
+    });
     va_end(ap);
-    FailOnException(env, name);
 }
 
 jint CallStaticInt(const char *cls, const char *name, const char *sig, ...) {
-    JNIEnv *env = Env();
-    jclass c = Class(cls);
-    jmethodID mid = StaticMethod(env, c, name, sig);
-    if (!mid) return 0;
     va_list ap;
     va_start(ap, sig);
-    jint r = env->CallStaticIntMethodV(c, mid, ap);
+    jint r = Static(cls, name, sig, jint{0},
+                    [&](JNIEnv *e, jclass c, jmethodID m) { return e->CallStaticIntMethodV(c, m, ap); });
     va_end(ap);
-    return FailOnException(env, name) ? 0 : r;
+    return r;
 }
 
 jlong CallStaticLong(const char *cls, const char *name, const char *sig, ...) {
-    JNIEnv *env = Env();
-    jclass c = Class(cls);
-    jmethodID mid = StaticMethod(env, c, name, sig);
-    if (!mid) return 0;
     va_list ap;
     va_start(ap, sig);
-    jlong r = env->CallStaticLongMethodV(c, mid, ap);
+    jlong r = Static(cls, name, sig, jlong{0},
+                     [&](JNIEnv *e, jclass c, jmethodID m) { return e->CallStaticLongMethodV(c, m, ap); });
     va_end(ap);
-    return FailOnException(env, name) ? 0 : r;
+    return r;
 }
 
 jboolean CallStaticBoolean(const char *cls, const char *name, const char *sig, ...) {
-    JNIEnv *env = Env();
-    jclass c = Class(cls);
-    jmethodID mid = StaticMethod(env, c, name, sig);
-    if (!mid) return JNI_FALSE;
     va_list ap;
     va_start(ap, sig);
-    jboolean r = env->CallStaticBooleanMethodV(c, mid, ap);
+    jboolean r = Static(cls, name, sig, jboolean{JNI_FALSE},
+                        [&](JNIEnv *e, jclass c, jmethodID m) { return e->CallStaticBooleanMethodV(c, m, ap); });
     va_end(ap);
-    return FailOnException(env, name) ? JNI_FALSE : r;
+    return r;
 }
 
 jobject CallStaticObject(const char *cls, const char *name, const char *sig, ...) {
-    JNIEnv *env = Env();
-    jclass c = Class(cls);
-    jmethodID mid = StaticMethod(env, c, name, sig);
-    if (!mid) return nullptr;
     va_list ap;
     va_start(ap, sig);
-    jobject r = env->CallStaticObjectMethodV(c, mid, ap);
+    jobject r = Static(cls, name, sig, jobject{},
+                       [&](JNIEnv *e, jclass c, jmethodID m) { return e->CallStaticObjectMethodV(c, m, ap); });
     va_end(ap);
-    return FailOnException(env, name) ? nullptr : r;
+    return r;
 }
 
 void StartDetached(std::function<void(JNIEnv *)> body, const char *threadName) {
     Vm();
     std::string name = threadName;
-    std::thread([body = std::move(body), name] {
-        JNIEnv *env = Attach(name.c_str());
+    jvmhost::StartDetached(threadName, [body = std::move(body), name](JNIEnv *env) {
+        if (!env) Die("cannot attach " + name + " to the JVM");
         body(env);
-        Vm()->DetachCurrentThread();
-    }).detach();
+    });
 }
 
 void RunOnThread(std::function<void(JNIEnv *)> body, const char *threadName) {
     Vm();
     std::string name = threadName;
     std::thread([&body, name] {
-        JNIEnv *env = Attach(name.c_str());
-        body(env);
-        Vm()->DetachCurrentThread();
+        body(Attach(name.c_str()));
+        jvmhost::Vm()->DetachCurrentThread();
     }).join();
 }
 
-std::vector<std::string> Options() { return BuildOptions(); }
+std::vector<std::string> Options() { return jvmhost::JvmOptions(Config()); }
 
 }  // namespace jvm

@@ -10,6 +10,7 @@
 #include "Host.h"
 #include "Script.h"
 #include "Sha256.h"
+#include "ShellCommands.h"
 #include "usbadapter/mfpbridge.h"
 #include "vdev.h"
 
@@ -507,6 +508,22 @@ const std::vector<Command> kCommands = {
     {"sleep", "MS", "waits MS milliseconds of real time", 1, 1, CheckNumberArgs, Sleep},
     {"set", "timeout MS", "bound of every later wait (default 10000)", 2, 2, CheckSet, Set},
     {"note", "TEXT...", "writes TEXT into the journal", 0, -1, nullptr, Note},
+    {"shell-start", "", "opens a test-shell session (ESC w MAASTART) and expects its acknowledgement", 0, 0, nullptr,
+     ShellStart},
+    {"shell", "LINE",
+     "sends a test-shell command line and prints the records that come back, decoded; $addr is the buffer of the "
+     "last shell-put",
+     1, 1, nullptr, ShellLine},
+    {"shell-expect", "TEXT...", "the decoded records of the last shell line are exactly TEXT..., in order", 0, -1,
+     nullptr, ShellExpect},
+    {"shell-put", "DATA...", "downloads DATA into a device buffer (H2T special command); its address becomes $addr", 1,
+     -1, CheckShellPut, ShellPut},
+    {"shell-stop", "", "stops the test-shell session (MAA-STOP) and expects its acknowledgement", 0, 0, nullptr,
+     ShellStop},
+    {"pty", "prn LINK",
+     "hands the print channel to a host tool: a pseudo-terminal, LINK a symbolic link to it, opened as a printer's "
+     "device node; returns when the tool has closed it",
+     2, 2, CheckPty, Pty},
 };
 
 }  // namespace

@@ -174,7 +174,7 @@ int ParseOptions(int argc, char **argv, Options &o) {
         case kFax: o.fax = std::atoi(optarg); break;
         case kXmx: o.jvm.maxHeap = optarg; break;
         case kNoCheckJni: o.jvm.checkJni = false; break;
-        case kJar: o.jvm.jar = Absolute(optarg); break;
+        case kJar: o.jvm.classPath = Absolute(optarg); break;
         case kLibDir: o.jvm.libDir = Absolute(optarg); break;
         case kJvmOption: o.jvm.extra.push_back(optarg); break;
         case 'v': o.verbose = true; break;

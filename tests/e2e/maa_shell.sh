@@ -1,0 +1,50 @@
+#!/bin/sh
+# The test shell end to end: usbadapter-sim plays the sample test-shell session,
+# whose records its host side decodes and checks (shell-expect), then hands the
+# print channel to the host tool usbadapter-shell as a pseudo-terminal.
+# usage: maa_shell.sh USBADAPTER-SIM USBADAPTER-SHELL
+set -u
+sim=$1
+tool=$2
+dir=$(mktemp -d /tmp/usbadapter-e2e-maa-XXXXXX)
+fail() {
+    echo "FAIL: $*"
+    echo "(files kept in $dir)"
+    exit 1
+}
+
+# The sample session: a path downloaded with its last letter wrong, corrected
+# by an assignment through a pointer into the download buffer, then dumped; the
+# symbol dump; after the stop the print reader has the channel back.
+script=$(dirname "$0")/../../tools/sim/samples/shell.sim
+"$sim" --out "$dir/out" --timeout 8000 --script "$script" >"$dir/sim.txt" 2>&1
+status=$?
+cat "$dir/sim.txt"
+[ $status -eq 0 ] || fail "scripted session: exit status $status"
+grep -q '"event":"shell-put","bytes":38,' "$dir/out/session.jsonl" || fail "no download in the journal"
+[ "$(grep -c '"event":"shell-record"' "$dir/out/session.jsonl")" -eq 8 ] || fail "not 8 records in the journal"
+
+# The host tool on the simulator's print channel: plain open/read/write.
+"$sim" --out "$dir/out2" --timeout 8000 -e "pty prn $dir/prn" -e "expect-jobs 0" >"$dir/sim2.txt" 2>&1 &
+pid=$!
+i=0
+while [ ! -L "$dir/prn" ]; do
+    i=$((i + 1))
+    [ $i -lt 400 ] || fail "the simulator made no pseudo-terminal"
+    sleep 0.05
+done
+"$tool" -w 300 -e 'Dump_File("/halvard/sys/statusinfo/usb_speed.txt")' -e 'Dump_File("/nothing")' "$dir/prn" \
+    >"$dir/tool.txt" 2>&1
+status=$?
+wait $pid
+simStatus=$?
+cat "$dir/tool.txt" "$dir/sim2.txt"
+[ $status -eq 0 ] || fail "usbadapter-shell: exit status $status"
+[ $simStatus -eq 0 ] || fail "simulator with the host tool: exit status $simStatus"
+printf '%s\n' "| HIGH" "= result 1: File Read Complete : /halvard/sys/statusinfo/usb_speed.txt" \
+    "= result 0: File Open Error /nothing" >"$dir/want.txt"
+cmp -s "$dir/tool.txt" "$dir/want.txt" || fail "usbadapter-shell printed something else"
+grep -q '"event":"pty-end","to-device":' "$dir/out2/session.jsonl" || fail "no pty-end in the journal"
+
+rm -rf "$dir"
+echo "PASS"

@@ -1,0 +1,130 @@
+// The test shell on the emulated print node: the session runs on a thread of
+// its own while the test plays the host with vdev's host side.
+#pragma once
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <functional>
+#include <future>
+#include <string>
+#include <vector>
+
+#include "LoggerHost.h"
+#include "adapter/Classifier.h"
+#include "adapter/USB.h"
+#include "common/ByteOrder.h"
+#include "maa/MAA_Address.h"
+#include "maa/MAA_Hook.h"
+#include "maa/MAA_IF.h"
+#include "maa/MAA_MM.h"
+#include "maa/MAA_Result.h"
+#include "maa/MAA_Symbol.h"
+#include "vdev.h"
+#include "vendor/VLX_Main.h"
+
+namespace maasession {
+
+inline const std::string kAck("\x1bwMAA-OK", 8);
+
+inline std::string BE32(U32 v) {
+    std::string s(4, '\0');
+    WriteBE32(reinterpret_cast<U8 *>(s.data()), v);
+    return s;
+}
+// A result frame as the host receives it.
+inline std::string Frame(U32 cont, U32 result, const std::string &data) {
+    return BE32(cont) + BE32(result) + BE32(static_cast<U32>(data.size())) + data;
+}
+inline std::string Transfer(U8 op, U32 size) { return std::string("#$%") + static_cast<char>(op) + BE32(size) + BE32(size); }
+// A special command line, host to device.
+inline std::string Special(U8 code, U32 size) { return std::string("#$%") + static_cast<char>(code) + BE32(size) + "\r"; }
+// A literal with NUL bytes in it.
+template <size_t N>
+std::string S(const char (&text)[N]) {
+    return std::string(text, N - 1);
+}
+inline std::string Str(const std::vector<uint8_t> &v) { return std::string(v.begin(), v.end()); }
+
+// A registered function (kind 1): its argument is its result code.
+inline std::vector<U32> probes;
+inline TMAAResult stProbe;
+inline std::string probeText;
+inline TMAAResult *probe(U32 n) {
+    probes.push_back(n);
+    probeText = "probe " + std::to_string(n);
+    stProbe = {MAA_RESULT_END, n, static_cast<U32>(probeText.size()),
+               reinterpret_cast<U8 *>(probeText.data())};
+    return &stProbe;
+}
+
+// Runs fn on a thread; if it has not returned in time the cable is pulled
+// so that it does, and the test fails.
+template <typename F>
+auto Bounded(F fn, std::function<void()> whileRunning = {}) {
+    auto f = std::async(std::launch::async, fn);
+    if (whileRunning) whileRunning();
+    if (f.wait_for(std::chrono::seconds(10)) != std::future_status::ready) {
+        ADD_FAILURE() << "still waiting for the host";
+        IsDisconnected = 1;
+        vdev::ExpirePoll(vdev::kPrn, 1);
+    }
+    return f.get();
+}
+
+struct Outcome {
+    S32 ret;
+    std::string command;  // the classifier's buffer afterwards
+    std::string wire;     // everything the device wrote
+};
+
+class SessionTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        vdev::Reset();
+        IsDisconnected = 0;
+        maa_session::slPollTimeout = MAA_POLL_TIMEOUT_FIRST;
+        enSpecialMode = MAA_NORMAL_CMD;
+        MAA_HeapFree(stCmdHeap.ulHeapPtr, 0);
+        stCmdHeap = {};
+        MAA_SymbolClear();
+        MAA_AddrReset();
+        probes.clear();
+        MAA_SymbolAdd(ftarget_ppc, "probe", MAA_SYM_FUNC, MAA_FuncEntry<probe>(), 1);
+        LoggerHost_StartCapture();
+        fd = ::open(vdev::kPrn, O_RDWR);
+        ASSERT_GT(fd, 0);
+        ulDrvHandle = static_cast<U32>(fd);
+    }
+    void TearDown() override {
+        ::close(fd);
+        vdev::Reset();
+        IsDisconnected = 0;
+        MAA_SymbolClear();
+        MAA_SetResultWriter(nullptr);
+        LoggerHost_StopCapture();
+    }
+
+    // The classifier has taken ESC "w"; the host sends `transfers`, then stays
+    // silent for `silences` poll periods.
+    Outcome Session(const std::vector<std::string> &transfers, int silences = 0,
+                    std::function<void()> whileRunning = {}) {
+        for (const std::string &t : transfers) vdev::HostWrite(vdev::kPrn, t);
+        if (silences) vdev::ExpirePoll(vdev::kPrn, silences);
+        U8 cmd[COMMAND_SIZE] = {0x1B, 'w'};
+        S32 ret = Bounded([&] { return MAA_Hook(static_cast<U32>(fd), cmd); }, std::move(whileRunning));
+        return {ret, std::string(reinterpret_cast<char *>(cmd), sizeof cmd), Str(vdev::HostRead(vdev::kPrn))};
+    }
+
+    // The saved-command buffer as written so far, with the NUL behind.
+    static std::string SavedCommands() {
+        return std::string(reinterpret_cast<char *>(stCmdHeap.ulHeapPtr), stCmdHeap.ulHeapIndex + 1);
+    }
+
+    int fd = -1;
+};
+
+}  // namespace maasession

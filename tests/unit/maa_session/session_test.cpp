@@ -1,0 +1,210 @@
+// The session protocol as a host sees it: start and stop handshake, command
+// lines, special commands, saved-command mode and a pulled cable.
+#include <thread>
+
+#include "maa_session/SessionFixture.h"
+#include "print/PrintRecorder.h"
+
+namespace maasession {
+namespace {
+
+TEST_F(SessionTest, StartCommandDecidesWhoOwnsTheBytes) {
+    struct Row {
+        const char *name;
+        std::vector<std::string> transfers;
+        int silences;
+        S32 ret;
+        std::string command;  // prefix of the classifier's buffer afterwards
+        std::string wire;
+        size_t left;          // host bytes the hook did not take
+    } rows[] = {
+        {"start, stop", {"MAASTART", "MAA-STOP\r"}, 0, 0, "\x1bw", kAck + kAck, 0},
+        {"split start, LF", {"MAAST", "ART", "MAA-STOP\n"}, 0, 0, "\x1bw", kAck + kAck, 0},
+        {"stop with more behind", {"MAASTART", "MAA-STOPPED\r"}, 0, 0, "\x1bw", kAck + kAck, 0},
+        {"wrong start", {"MAASTARX and more"}, 0, 8, "\x1bwMAASTARX", "", 9},
+        {"short start", {"MAAS"}, 1, 4, "\x1bwMAAS", "", 0},
+        {"silence", {}, 1, -1, "\x1bw", "", 0},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.name);
+        Outcome o = Session(r.transfers, r.silences);
+        EXPECT_EQ(o.ret, r.ret);
+        EXPECT_EQ(o.command.substr(0, r.command.size()), r.command);
+        EXPECT_EQ(o.wire, r.wire);
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), r.left);
+        ::close(fd);
+        vdev::Reset();
+        fd = ::open(vdev::kPrn, O_RDWR);
+    }
+}
+
+TEST_F(SessionTest, FirstWaitIsFiveMinutesLaterOnesFiveSeconds) {
+    Session({}, 1);
+    Session({"MAAS"}, 1);
+    std::vector<int> t = vdev::PollTimeouts(vdev::kPrn);
+    ASSERT_EQ(t.size(), 6u);
+    EXPECT_EQ(t.front(), 300000);
+    EXPECT_EQ(std::vector<int>(t.begin() + 1, t.end()), std::vector<int>(5, 5000));
+}
+
+TEST(CheckCommand, BalanceOfQuotesParenthesesAndBrackets) {
+    struct Row {
+        const char *line;
+        U32 ok;
+    } rows[] = {
+        {"123", 0}, {"\t9x", 0}, {"x9", 1}, {"  f(1)", 1}, {"f(1;", 0}, {"f(\"(\")", 0},
+        {"f(1); g(2)", 1}, {"f(1;2)", 0}, {"a[1] = f(2)", 1}, {"f[1)", 0}, {")(", 1},
+        {"\"a\" \"b\"", 1}, {"", 1},
+    };
+    for (const Row &r : rows) EXPECT_EQ(MAA_CheckCommand(reinterpret_cast<const U8 *>(r.line)), r.ok) << r.line;
+}
+
+TEST_F(SessionTest, LineEndsAtCrLfOrTheLimitAndTakesEightRawBytesBehindAHash) {
+    struct Row {
+        const char *name;
+        std::string sent;
+        std::vector<std::string> lines;
+    } rows[] = {
+        {"CR and LF", "ab\r\ncd\n", {"ab", "", "cd"}},
+        {"limit", std::string(1030, 'a') + "\r", {std::string(1025, 'a'), "aaaaa"}},
+        {"hash, raw CR last", S("x#\r\n\0y\0\0\0\rz\r"), {S("x#\r\n\0y\0\0\0\r"), "z"}},
+        {"hash, last raw byte twice", "#abcdefghij\r", {"#abcdefghhij"}},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.name);
+        vdev::HostWrite(vdev::kPrn, r.sent);
+        for (const std::string &want : r.lines) {
+            U8 buf[MAA_LINE_BUFFER_SIZE];
+            Bounded([&] { return MAA_ReadLine(static_cast<U32>(fd), buf); });
+            // The line's length: where the terminator was written.
+            size_t len = want.size();
+            EXPECT_EQ(std::string(reinterpret_cast<char *>(buf), len + 1), want + '\0');
+        }
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 0u);
+    }
+}
+
+TEST_F(SessionTest, DownloadSendsItsAddressAndTakesExactlyTheAnnouncedBytes) {
+    const std::string raw = S("\nMAA-STOP\r\0#$%(\n");
+    ASSERT_EQ(raw.size(), 16u);
+    Outcome o = Session({"MAASTART", Special(MAA_FILE_TRANS_H2T, 16) + raw.substr(0, 5), raw.substr(5) + "probe(4)\r",
+                         "MAA-STOP\r"});
+    EXPECT_EQ(o.ret, 0);
+    ASSERT_EQ(o.wire.size(), kAck.size() + 4 + Frame(1, 4, "probe 4").size() + kAck.size());
+    EXPECT_EQ(o.wire.substr(0, 8), kAck);
+    EXPECT_EQ(o.wire.substr(12), Frame(1, 4, "probe 4") + kAck) << "the line behind the file is whole";
+
+    const U32 address = ReadBE32(reinterpret_cast<const U8 *>(o.wire.data() + 8));
+    EXPECT_GE(address, MAA_ADDR_BASE);
+    const U8 *buffer = static_cast<const U8 *>(MAA_AddrTranslate(address, 16));
+    ASSERT_NE(buffer, nullptr);
+    EXPECT_EQ(std::string(reinterpret_cast<const char *>(buffer), 16), raw);
+    EXPECT_EQ(MAA_AddrTranslate(address, 17), nullptr) << "the buffer is exactly the announced size";
+
+    // A second download replaces the first: its address is no longer reachable.
+    o = Session({"MAASTART", Special(MAA_FILE_TRANS_H2T, 2) + "ok", "MAA-STOP\r"});
+    EXPECT_NE(ReadBE32(reinterpret_cast<const U8 *>(o.wire.data() + 8)), address);
+    EXPECT_EQ(MAA_AddrTranslate(address, 1), nullptr);
+}
+
+TEST_F(SessionTest, SizeBytesThatUnbalanceTheLineMakeAnInvalidCommand) {
+    Outcome o = Session({"MAASTART", S("#$%\x04\x01(\0\0\r"), "MAA-STOP\r"});
+    EXPECT_EQ(o.wire, kAck + kAck);
+    EXPECT_EQ(LoggerHost_Count("\r\n[MAA] Invalid Command"), 1);
+    EXPECT_EQ(stCmdHeap.ulHeapPtr, nullptr) << "no buffer for a rejected command";
+    EXPECT_EQ(enSpecialMode, MAA_NORMAL_CMD);
+}
+
+TEST_F(SessionTest, AutoSessionSavesItsLinesAndRunsThemSilentlyAfterTheStop) {
+    MAA_SymbolAdd(ftarget_ppc, "a", MAA_SYM_UNDEF, 0, 0);
+    MAA_SymbolAdd(ftarget_ppc, "b", MAA_SYM_UNDEF, 0, 0);
+    Outcome o = Session({"MAASTART", Special(MAA_AUTO_MODE_START, 40), "a=1\r", "b=2\r", "probe(7)\r",
+                         Special(MAA_AUTO_MODE_END, 0), "probe(8)\r", "MAA-STOP\r"});
+    EXPECT_EQ(o.ret, 0);
+    EXPECT_EQ(o.wire, kAck + kAck) << "an auto run writes nothing";
+    EXPECT_EQ(SavedCommands(), S("a=1\0\nb=2\0\nprobe(7)\0\nprobe(8)\0\n\0"));
+    EXPECT_EQ(stCmdHeap.ulHeapSize, 40u);
+    EXPECT_EQ(probes, (std::vector<U32>{7, 8}));
+    U32 a = 0, b = 0;
+    MAA_AddrRead(MAA_SymbolFind("a")->ulAddress, 4, &a);
+    MAA_AddrRead(MAA_SymbolFind("b")->ulAddress, 4, &b);
+    EXPECT_EQ(a, 1u);
+    EXPECT_EQ(b, 2u);
+    EXPECT_EQ(enSpecialMode, MAA_NORMAL_CMD);
+}
+
+TEST_F(SessionTest, PulledCableEndsTheSessionAndDropsTheCutLine) {
+    const std::string first = kAck + Frame(1, 1, "probe 1");
+    Outcome o = Session({"MAASTART", "probe(1)\r", "probe(2"}, 0, [&] {
+        EXPECT_EQ(Str(vdev::HostReadAtLeast(vdev::kPrn, first.size(), 5000)), first);
+        for (int i = 0; i < 5000 && vdev::PendingHostBytes(vdev::kPrn) != 0; ++i)
+            std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        IsDisconnected = 1;
+        vdev::ExpirePoll(vdev::kPrn, 1);
+    });
+    EXPECT_EQ(o.ret, 0);
+    EXPECT_EQ(o.wire, "");
+    EXPECT_EQ(probes, std::vector<U32>{1});
+    EXPECT_EQ(LoggerHost_Count("\r\n[MAA:MAA_Hook] Cable Disconnected during MAA_ReadLine"), 1);
+}
+
+TEST_F(SessionTest, DriverLayerReadsOneByteAndHidesWriteErrorsButNotADisconnect) {
+    vdev::HostWrite(vdev::kPrn, "xyz");
+    U8 *p = nullptr;
+    U32 n = 0;
+    EXPECT_EQ(DM_ReadDriver(static_cast<U32>(fd), &p, 3, &n, nullptr), DM_RET_OK);
+    EXPECT_EQ(n, 1u);
+    EXPECT_EQ(*p, 'x');
+    EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 2u);
+
+    EXPECT_EQ(DM_WriteDriver(0xFFFFFFFF, HeaderResCmd, 8, &n, nullptr), DM_RET_OK);
+    EXPECT_EQ(n, 8u);
+    EXPECT_TRUE(LoggerHost_Contains("[MAA] WriteDriver: write (ret=-1,errno=9,"));
+
+    IsDisconnected = 1;
+    EXPECT_EQ(DM_WriteDriver(static_cast<U32>(fd), HeaderResCmd, 8, &n, nullptr), DM_RET_USB_DISCONNECTED);
+    EXPECT_EQ(DM_ReadDriver(static_cast<U32>(fd), &p, 1, &n, nullptr), DM_RET_USB_DISCONNECTED);
+    EXPECT_TRUE(vdev::HostRead(vdev::kPrn).empty());
+    EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 2u);
+}
+
+// ---- the whole road through the print reader and the classifier -------------------
+
+class SessionRoad : public ReaderTest {
+protected:
+    void SetUp() override {
+        ReaderTest::SetUp();
+        IsDisconnected = 0;
+        MAA_SymbolClear();
+        probes.clear();
+        MAA_SymbolAdd(ftarget_ppc, "probe", MAA_SYM_FUNC, MAA_FuncEntry<probe>(), 1);
+    }
+    void TearDown() override {
+        MAA_SymbolClear();
+        MAA_SetResultWriter(nullptr);
+        ReaderTest::TearDown();
+    }
+};
+
+TEST_F(SessionRoad, WrongStartCommandIsPrintData) {
+    Send({"\x1bwMAASTARX", "rest of the job"});
+    auto jobs = rec::Jobs();
+    ASSERT_EQ(jobs.size(), 1u);
+    EXPECT_EQ(jobs[0].bytes, "\x1bwMAASTARXrest of the job");
+    EXPECT_TRUE(vdev::HostRead(vdev::kPrn).empty());
+}
+
+TEST_F(SessionRoad, SessionOwnsTheChannelUntilTheStop) {
+    for (const char *t : {"\x1bwMAASTART", "probe(3)\r", "MAA-STOP\r", "after"}) vdev::HostWrite(vdev::kPrn, t);
+    Bounded([] {
+        USBAdapter_ReadPass();
+        return 0;
+    });
+    EXPECT_EQ(Str(vdev::HostRead(vdev::kPrn)), kAck + Frame(1, 3, "probe 3") + kAck);
+    EXPECT_TRUE(rec::Jobs().empty());
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] MAACommand executed\n"), 1);
+    EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 5u) << "the bytes behind the stop are the reader's";
+}
+
+}  // namespace
+}  // namespace maasession
