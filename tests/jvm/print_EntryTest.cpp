@@ -6,7 +6,6 @@
 namespace {
 
 using printjvm::ReadPrintMsg;
-using printjvm::WaitUntil;
 
 // A new object of `cls` held only through a global reference the test drops
 // itself, and a weak reference that tells whether anything still holds it.

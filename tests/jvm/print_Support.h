@@ -7,10 +7,8 @@
 
 #include <gtest/gtest.h>
 
-#include <chrono>
 #include <fstream>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "Fixtures.h"
@@ -18,6 +16,7 @@
 #include "LoggerHost.h"
 #include "support/MsgQueue.h"
 #include "support/TempRoot.h"
+#include "support/WaitUntil.h"
 #include "usbadapter/mfpbridge.h"
 #include "vdev.h"
 
@@ -26,16 +25,6 @@ namespace printjvm {
 inline const std::string kUel = "\x1b%-12345X";
 inline constexpr const char *kReadPrintMsgSig =
     "(Ljava/lang/Object;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;I)V";
-
-template <typename Pred>
-bool WaitUntil(Pred pred, int ms = 10000) {
-    auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);
-    while (!pred()) {
-        if (std::chrono::steady_clock::now() > end) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    }
-    return true;
-}
 
 // Calls readPrintMsg on `daemon` on the calling thread; null texts pass null.
 inline void ReadPrintMsg(JNIEnv *env, jobject daemon, jobject maa, const char *manufacturer, const char *model,
@@ -67,26 +56,14 @@ inline bool AwaitJobBytes(int job, long long bytes, int ms = 10000) {
 
 class PrintJvmTest : public ::testing::Test {
 protected:
-    static constexpr const char *kKeyFile = "/halvard/spool/tmp/testfile";
-
     void SetUp() override {
         vdev::Reset();
         LoggerHost_StartCapture();
         fixtures::Reset();
-        // A reused inode gives the same key: drop queues a crashed run left.
-        std::ofstream(root_ / kKeyFile).flush();
-        RemoveQueues();
+        std::ofstream(root_ / kQueueKeyFile).flush();
+        RemoveQueues(root_);
     }
-    void TearDown() override { RemoveQueues(); }
-
-    int QueueOf(int proj) const {
-        key_t key = ftok((root_ / kKeyFile).c_str(), proj);
-        return key == -1 ? -1 : msgget(key, 0);
-    }
-    void RemoveQueues() const {
-        RemoveQueue(QueueOf(5));
-        RemoveQueue(QueueOf(6));
-    }
+    void TearDown() override { RemoveQueues(root_); }
 
     // Queues created through `daemon` (it is a service object), then the reader
     // started on its own thread. With `configure` the print node is set up and
@@ -99,20 +76,20 @@ protected:
         jstring model = jvm::Str(env, "TW-4020 MFP");
         jvm::CallVoid(daemon_, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", model);
         env->DeleteLocalRef(model);
-        ASSERT_GE(QueueOf(5), 0);
+        ASSERT_GE(QueueOf(root_, 5), 0);
         jobject daemon = daemon_, maa = maa_;
         jvm::StartDetached(
             [daemon, maa](JNIEnv *e) { printjvm::ReadPrintMsg(e, daemon, maa, "Tarnwel", "TW-4020 MFP", "printer"); },
             "print-reader");
         if (!configure) {
-            ASSERT_TRUE(printjvm::WaitUntil([] { return LoggerHost_Contains("[USBAdp]Inside USBAdapter_IF_PrintFunction"); }));
+            ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp]Inside USBAdapter_IF_PrintFunction"); }));
             return;
         }
         jvm::CallVoid(daemon_, "initDevice", "()V");
-        ASSERT_TRUE(printjvm::WaitUntil([] { return LoggerHost_Contains("[USBAdp]Exited Initialization(), fdPrn:"); }));
+        ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp]Exited Initialization(), fdPrn:"); }));
         ASSERT_TRUE(vdev::AsyncEnabled(vdev::kPrn));
         vdev::QueueNotification(vdev::kPrn, printjvm::Notification(MFP_DEV_CONFIGURED));
-        ASSERT_TRUE(printjvm::WaitUntil([] { return vdev::PollTimeouts(vdev::kPrn).size() >= 1; }));
+        ASSERT_TRUE(WaitUntil([] { return vdev::PollTimeouts(vdev::kPrn).size() >= 1; }));
     }
 
     // The host's silence: the reader's waiting poll times out now. Call it when

@@ -81,30 +81,6 @@ TEST_F(PrintUpcalls, DataAndEndBeforeAnyJobAreLoggedAndDropped) {
     EXPECT_EQ(fixtures::Events(), "");
 }
 
-TEST_F(PrintUpcalls, ExceptionInAddBufferToListIsClearedAndTheNextChunkArrives) {
-    Start();
-    if (HasFatalFailure()) return;
-    ASSERT_EQ(up.RegisterJob(""), 1);
-    fixtures::ThrowOn("addBufferToList", 1);
-    up.Pass("thrown");
-    EXPECT_FALSE(ExceptionPending());
-    up.Pass("kept");
-    up.NotifyEndOfData();
-    EXPECT_EQ(fixtures::JobBytes(0), "kept");
-    EXPECT_TRUE(fixtures::JobEnded(0));
-    EXPECT_EQ(fixtures::Calls("addBufferToList"), 2);
-}
-
-TEST_F(PrintUpcalls, MissingProcessPrintCommandStillAnswersOne) {
-    Start(fixtures::kDaemonWithoutPrintCommand);
-    if (HasFatalFailure()) return;
-    EXPECT_EQ(up.RegisterJob(""), 1);
-    EXPECT_FALSE(ExceptionPending());
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in RegisterJob()::can't find processPrintCommand().\n"), 1);
-    up.Pass("dropped");
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] globalUSBPrintFileStreamObj == NULL\n"), 1);
-}
-
 TEST_F(PrintUpcalls, NullHandlerAnswersMinusOne) {
     Start();
     if (HasFatalFailure()) return;

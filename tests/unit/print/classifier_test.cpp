@@ -3,13 +3,13 @@
 // that share ESC 0x91.
 #include <fcntl.h>
 
-#include <chrono>
 #include <cstring>
 #include <thread>
 
 #include "common/ByteOrder.h"
 #include "print/PrintRecorder.h"
 #include "scan/USBScan.h"
+#include "support/WaitUntil.h"
 
 namespace {
 
@@ -114,8 +114,8 @@ TEST_F(Classifier, EscapeWHandsBackWhatFollowedWhenItIsNoMaaSession) {
     EXPECT_EQ(LoggerHost_Count("[USBAdp] Not MAA packet: 6\n"), 1);
 
     // At most the eight bytes of a start command are taken.
-    o = Classify("\x1bw", {"MAASTART and more"});
-    EXPECT_EQ(o.handedBack, "\x1bwMAASTART");
+    o = Classify("\x1bw", {"MAASTARX and more"});
+    EXPECT_EQ(o.handedBack, "\x1bwMAASTARX");
     EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), std::string(" and more").size());
 }
 
@@ -188,9 +188,7 @@ TEST_F(Classifier, BodyWaitsOutDriverTimeOutsUntilItIsComplete) {
     vdev::HostWrite(vdev::kPrn, "fax1");
     vdev::ExpireRead(vdev::kPrn, 3);  // three reads end in the driver's time-out first
     std::thread host([] {
-        auto until = std::chrono::steady_clock::now() + std::chrono::seconds(3);
-        while (vdev::ReadSizes(vdev::kPrn).size() < 7 && std::chrono::steady_clock::now() < until)
-            std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        WaitUntil([] { return vdev::ReadSizes(vdev::kPrn).size() >= 7; }, 3000);
         vdev::HostWrite(vdev::kPrn, "fax2");
     });
     Outcome o = Classify(hdr.substr(0, 2));

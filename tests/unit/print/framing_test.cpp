@@ -97,7 +97,11 @@ TEST_F(Framing, HeldUelBytesOfAnOpenJobStayInItWhenSilenceEndsIt) {
     EXPECT_EQ(LoggerHost_Count("[USBAdp]Held UEL bytes passed at end of job: [5]\n"), 1);
 }
 
-TEST_F(Framing, UelLastInTheReadOpensTheJobInsteadOfEndingIt) {
+TEST_F(Framing, UelBehindDataEndsTheJobUnlessItIsLastInTheRead) {
+    Send({"end of a job" + kUel + Framed("next")});
+    ExpectJobs({"end of a job" + kUel, Framed("next")});
+
+    rec::Clear();
     Send({"lead-in" + kUel}, false);
     ASSERT_EQ(rec::Jobs().size(), 1u);
     EXPECT_FALSE(rec::Jobs()[0].ended);
@@ -118,11 +122,14 @@ TEST_F(Framing, ShortPjlPrefixIsDeliveredWithoutAFurtherRead) {
     EXPECT_EQ(LoggerHost_Count("[USBAdp] Data less than 80bytes: 15\n"), 1);
 }
 
-TEST_F(Framing, SingleByteTransfersAreNotLost) {
+TEST_F(Framing, DataWithoutUelIsOneJobUntilSilence) {
     Send({"Z"});
     ExpectJobs({"Z"});
     rec::Clear();
-    Send({"Y", "ab", "c"});
+    Send({"Y", "ab", "c"}, false);
+    ASSERT_EQ(rec::Jobs().size(), 1u);
+    EXPECT_FALSE(rec::Jobs()[0].ended);
+    Silence();
     ExpectJobs({"Yabc"});
 }
 
@@ -229,28 +236,25 @@ std::string Join(const std::vector<std::string> &parts) {
     return all;
 }
 
-TEST_F(Framing, FortyMebibyteJobInMebibyteTransfersArrivesWhole) {
+// A 40 MiB framed job in 1 MiB transfers, each passed in one chunk, and a 9 MiB
+// unframed one in odd transfer sizes that ends in a held escape.
+TEST_F(Framing, LargeJobsArriveWhole) {
     LoggerHost_StopCapture();
-    auto transfers = Transfers(Framed(RandomBytes((40u << 20) - 18, 42)), 1u << 20);
-    const std::string stream = Join(transfers);
-    Send(transfers);
-    auto jobs = rec::Jobs();
-    ASSERT_EQ(jobs.size(), 1u);
-    EXPECT_TRUE(jobs[0].bytes == stream) << "delivered " << jobs[0].bytes.size() << " of " << stream.size();
-    EXPECT_TRUE(jobs[0].ended);
-    EXPECT_EQ(jobs[0].chunks.size(), 40u);
-}
-
-TEST_F(Framing, UnframedLargeJobWithOddTransferSizesArrivesWhole) {
-    LoggerHost_StopCapture();
-    auto transfers = Transfers(RandomBytes(9u << 20, 7), (1u << 20) - 3);
-    transfers.push_back("\x1b");  // ends in a held escape
-    const std::string stream = Join(transfers);
-    Send(transfers);
-    auto jobs = rec::Jobs();
-    ASSERT_EQ(jobs.size(), 1u);
-    EXPECT_TRUE(jobs[0].bytes == stream) << "delivered " << jobs[0].bytes.size() << " of " << stream.size();
-    EXPECT_TRUE(jobs[0].ended);
+    std::vector<std::string> unframed = Transfers(RandomBytes(9u << 20, 7), (1u << 20) - 3);
+    unframed.push_back("\x1b");
+    const std::pair<std::vector<std::string>, size_t> cases[] = {
+        {Transfers(Framed(RandomBytes((40u << 20) - 18, 42)), 1u << 20), 40}, {unframed, 0}};
+    for (const auto &[transfers, chunks] : cases) {
+        rec::Clear();
+        ResetReader();
+        const std::string stream = Join(transfers);
+        Send(transfers);
+        auto jobs = rec::Jobs();
+        ASSERT_EQ(jobs.size(), 1u);
+        EXPECT_TRUE(jobs[0].bytes == stream) << "delivered " << jobs[0].bytes.size() << " of " << stream.size();
+        EXPECT_TRUE(jobs[0].ended);
+        EXPECT_TRUE(!chunks || jobs[0].chunks.size() == chunks) << jobs[0].chunks.size() << " chunks";
+    }
 }
 
 }  // namespace

@@ -1,12 +1,9 @@
-// Notifications: the queue behind MFP_IOC_GET_NOTIF, SIGIO raised only for an
-// owner that switched on O_ASYNC (never for arriving data), the model's view of
-// F_SETOWN / F_SETFL / F_GETFL, and a handler that may interrupt vdev itself.
-#include <poll.h>
+// SIGIO raised for a notification only to an owner that switched on O_ASYNC
+// (never for arriving data), and a handler that may interrupt vdev itself.
 #include <pthread.h>
 #include <signal.h>
 
 #include <atomic>
-#include <stdexcept>
 #include <thread>
 
 #include "vdev/VdevTest.h"
@@ -58,36 +55,6 @@ protected:
 
 }  // namespace
 
-TEST_F(Notifications, GetNotifReturnsQueuedNotificationsOldestFirst) {
-    UniqueFd fd = Open(vdev::kPrn);
-    vdev::QueueNotification(vdev::kPrn, Notif(MFP_DEV_CONFIGURED, eMfp_Notif_Both));
-    vdev::QueueNotification(vdev::kPrn, Notif(MFP_DEV_DISCONNECT));
-    EXPECT_EQ(vdev::PendingNotifications(vdev::kPrn), 2u);
-    EXPECT_EQ(vdev::PendingNotifications(vdev::kScan), 0u);
-
-    mfp_notif_t n{};
-    ASSERT_EQ(ioctl(fd.get(), MFP_IOC_GET_NOTIF, &n), 0);
-    EXPECT_EQ(n.ub_notif, MFP_DEV_CONFIGURED);
-    EXPECT_EQ(S32{n.ub_intf}, eMfp_Notif_Both);
-    ASSERT_EQ(ioctl(fd.get(), MFP_IOC_GET_NOTIF, &n), 0);
-    EXPECT_EQ(n.ub_notif, MFP_DEV_DISCONNECT);
-    EXPECT_EQ(vdev::PendingNotifications(vdev::kPrn), 0u);
-}
-
-TEST_F(Notifications, GetNotifOnAnEmptyQueueFailsWithEagain) {
-    UniqueFd fd = Open(vdev::kPrn);
-    mfp_notif_t n{};
-    n.ub_notif = 0x77;
-    errno = 0;
-    EXPECT_EQ(ioctl(fd.get(), MFP_IOC_GET_NOTIF, &n), -1);
-    EXPECT_EQ(errno, EAGAIN);
-    EXPECT_EQ(n.ub_notif, 0x77) << "a failed call leaves the record alone";
-    // A notification for the other node is not this node's.
-    vdev::QueueNotification(vdev::kScan, Notif(SCAN_COMMAND, eMfp_Notif_Scan));
-    EXPECT_EQ(ioctl(fd.get(), MFP_IOC_GET_NOTIF, &n), -1);
-    EXPECT_EQ(errno, EAGAIN);
-}
-
 TEST_F(Notifications, SigioIsRaisedOnlyWithOasyncAndAnOwner) {
     UniqueFd fd = Open(vdev::kPrn);
     gHandlerFd = fd.get();
@@ -106,6 +73,9 @@ TEST_F(Notifications, SigioIsRaisedOnlyWithOasyncAndAnOwner) {
 
     ASSERT_EQ(fcntl(fd.get(), F_SETOWN, getpid()), 0);
     EXPECT_EQ(fcntl(fd.get(), F_GETOWN), getpid());
+    vdev::HostWrite(vdev::kPrn, "data that a plain socket would signal");
+    char buf[64];
+    ASSERT_GT(read(fd.get(), buf, sizeof buf), 0);
     vdev::QueueNotification(vdev::kPrn, Notif(MFP_DEV_CONFIGURED));  // both
     ASSERT_TRUE(WaitUntil([] { return gSignals.load() >= 1; }));
     std::this_thread::sleep_for(std::chrono::milliseconds(20));
@@ -113,70 +83,6 @@ TEST_F(Notifications, SigioIsRaisedOnlyWithOasyncAndAnOwner) {
     EXPECT_EQ(gNotified.load(), 1);
     EXPECT_EQ(gLastNotif.load(), MFP_DEV_RESET) << "the handler gets the oldest pending notification";
     EXPECT_EQ(vdev::PendingNotifications(vdev::kPrn), 3u);
-}
-
-TEST_F(Notifications, ArrivingDataNeverRaisesSigio) {
-    UniqueFd fd = Open(vdev::kPrn);
-    gHandlerFd = fd.get();
-    ASSERT_EQ(fcntl(fd.get(), F_SETOWN, getpid()), 0);
-    ASSERT_EQ(fcntl(fd.get(), F_SETFL, O_ASYNC), 0);
-    vdev::HostWrite(vdev::kPrn, "data that a plain socket would signal");
-    pollfd p{fd.get(), POLLIN, 0};
-    ASSERT_EQ(poll(&p, 1, 1000), 1);
-    char buf[64];
-    ASSERT_GT(read(fd.get(), buf, sizeof buf), 0);
-    ASSERT_EQ(write(fd.get(), "x", 1), 1);
-    std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    EXPECT_EQ(gSignals.load(), 0);
-}
-
-TEST_F(Notifications, SigioStopsWhenTheOwnersDescriptorIsClosed) {
-    UniqueFd fd = Open(vdev::kPrn);
-    ASSERT_EQ(fcntl(fd.get(), F_SETOWN, getpid()), 0);
-    ASSERT_EQ(fcntl(fd.get(), F_SETFL, O_ASYNC), 0);
-    fd.reset();
-    EXPECT_EQ(vdev::OpenCount(vdev::kPrn), 0);
-    EXPECT_EQ(vdev::Owner(vdev::kPrn), 0);
-    EXPECT_FALSE(vdev::AsyncEnabled(vdev::kPrn));
-    vdev::QueueNotification(vdev::kPrn, Notif(MFP_DEV_RESET));
-    std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    EXPECT_EQ(gSignals.load(), 0);
-}
-
-TEST_F(Notifications, StatusFlagsAreTheModelsAndCanBeForced) {
-    UniqueFd fd = Open(vdev::kPrn);
-    EXPECT_EQ(fcntl(fd.get(), F_GETFL) & O_ACCMODE, O_RDWR);
-    EXPECT_EQ(fcntl(fd.get(), F_GETFL) & (O_NONBLOCK | O_ASYNC), 0);
-
-    // The opener's sequence: flags of another descriptor plus FASYNC.
-    ASSERT_EQ(fcntl(fd.get(), F_SETFL, O_RDONLY | 0x2000), 0);
-    EXPECT_EQ(fcntl(fd.get(), F_GETFL), O_RDWR | O_ASYNC) << "F_SETFL leaves the access mode alone";
-    EXPECT_EQ(vdev::StatusFlags(vdev::kPrn), O_ASYNC);
-
-    vdev::ForceStatusFlags(vdev::kPrn, O_NONBLOCK | O_ASYNC);
-    EXPECT_EQ(fcntl(fd.get(), F_GETFL), O_RDWR | O_NONBLOCK | O_ASYNC);
-    char c;
-    EXPECT_EQ(read(fd.get(), &c, 1), -1) << "a forced O_NONBLOCK is real";
-    EXPECT_EQ(errno, EAGAIN);
-    ASSERT_EQ(fcntl(fd.get(), F_SETFL, O_ASYNC), 0);
-    EXPECT_EQ(fcntl(fd.get(), F_GETFL), O_RDWR | O_ASYNC);
-    EXPECT_EQ(vdev::StatusFlags(vdev::kPrn), O_ASYNC);
-
-    // Commands the model does not keep reach the descriptor itself.
-    ASSERT_EQ(fcntl(fd.get(), F_SETFD, FD_CLOEXEC), 0);
-    EXPECT_EQ(fcntl(fd.get(), F_GETFD), FD_CLOEXEC);
-}
-
-TEST_F(Notifications, QueueRefusesMoreThanItsCapacity) {
-    for (size_t i = 0; i < vdev::kNotificationCapacity; ++i) {
-        vdev::QueueNotification(vdev::kScan, Notif(SCAN_COMMAND, eMfp_Notif_Scan));
-    }
-    EXPECT_THROW(vdev::QueueNotification(vdev::kScan, Notif(SCAN_COMMAND)), std::length_error);
-    UniqueFd fd = Open(vdev::kScan);
-    mfp_notif_t n{};
-    ASSERT_EQ(ioctl(fd.get(), MFP_IOC_GET_NOTIF, &n), 0);
-    vdev::QueueNotification(vdev::kScan, Notif(MFP_DEV_RESET));  // room again
-    EXPECT_EQ(vdev::PendingNotifications(vdev::kScan), vdev::kNotificationCapacity);
 }
 
 // The handler runs on a thread that is busy inside vdev (holding its lock at

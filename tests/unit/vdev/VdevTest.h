@@ -5,11 +5,11 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <thread>
 
 #include <gtest/gtest.h>
 
 #include "common/UniqueFd.h"
+#include "support/WaitUntil.h"
 #include "vdev.h"
 
 class VdevTest : public ::testing::Test {
@@ -19,17 +19,6 @@ protected:
 
     static UniqueFd Open(const char *path, int flags = O_RDWR) { return UniqueFd(::open(path, flags)); }
 };
-
-// Polls `pred` until it holds or `ms` have passed; true when it held.
-template <typename Pred>
-bool WaitUntil(Pred pred, int ms = 3000) {
-    auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);
-    while (!pred()) {
-        if (std::chrono::steady_clock::now() > end) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    }
-    return true;
-}
 
 inline long ElapsedMs(std::chrono::steady_clock::time_point since) {
     return static_cast<long>(
