@@ -110,15 +110,15 @@ bool CheckDataItem(const std::string &item, std::string *error) {
     if (StartsWith(item, "pattern:") || StartsWith(item, "fill:")) {
         // The size here; the rest by making zero bytes of the same item.
         const size_t colon = item.find(':');
-        const std::string spec = item.substr(colon + 1);
-        const size_t second = spec.find(':');
+        const std::string arg = item.substr(colon + 1);
+        const size_t second = arg.find(':');
         size_t n = 0;
-        if (!ParseSize(spec.substr(0, second), &n)) {
+        if (!ParseSize(arg.substr(0, second), &n)) {
             *error = "bad size in " + item;
             return false;
         }
         std::string bytes;
-        const std::string rest = second == std::string::npos ? "" : spec.substr(second);
+        const std::string rest = second == std::string::npos ? "" : arg.substr(second);
         if (BuildData({item.substr(0, colon + 1) + "0" + rest}, "", &bytes, error)) return true;
         *error = "bad " + item + (item[0] == 'p' ? " (pattern:N[:SEED])" : " (fill:N:HH)");
         return false;
@@ -143,23 +143,23 @@ bool BuildData(const std::vector<std::string> &items, const std::string &baseDir
         } else if (StartsWith(item, "text:")) {
             *bytes += item.substr(5);
         } else if (StartsWith(item, "pattern:")) {
-            std::string spec = item.substr(8);
-            size_t colon = spec.find(':');
+            std::string arg = item.substr(8);
+            size_t colon = arg.find(':');
             size_t n = 0;
             char *end = nullptr;
-            unsigned long seed = colon == std::string::npos ? 1 : std::strtoul(spec.c_str() + colon + 1, &end, 0);
-            if (!ParseSize(spec.substr(0, colon), &n) || (end && *end)) {
+            unsigned long seed = colon == std::string::npos ? 1 : std::strtoul(arg.c_str() + colon + 1, &end, 0);
+            if (!ParseSize(arg.substr(0, colon), &n) || (end && *end)) {
                 *error = "bad pattern: " + item + " (pattern:N[:SEED])";
                 return false;
             }
             Pattern(n, static_cast<uint32_t>(seed), bytes);
         } else if (StartsWith(item, "fill:")) {
-            std::string spec = item.substr(5);
-            size_t colon = spec.find(':');
+            std::string arg = item.substr(5);
+            size_t colon = arg.find(':');
             size_t n = 0;
             std::string value;
-            if (colon == std::string::npos || !ParseSize(spec.substr(0, colon), &n) ||
-                !ParseHex(spec.substr(colon + 1), &value, error) || value.size() != 1) {
+            if (colon == std::string::npos || !ParseSize(arg.substr(0, colon), &n) ||
+                !ParseHex(arg.substr(colon + 1), &value, error) || value.size() != 1) {
                 *error = "bad fill: " + item + " (fill:N:HH)";
                 return false;
             }
