@@ -73,9 +73,11 @@ bool openJob(const TPrintDelivery &d, const char *createdLine) {
     USBADP_LOG(INFO, "[USBAdp]receiving %d\n", r);
     if (r < 0) {
         USBADP_LOG(ERROR, "[USBAdp]returning back\n");
-        // No job: a UEL already counted for it must not count for the next one.
+        // No job: a UEL already counted for it must not count for the next
+        // one, nor a UEL cut at the end of the dropped chunk mark the next.
         readFlag = 0;
         jobCounter = 0;
+        splitPatternFlag = 0;
         return false;
     }
     return true;

@@ -151,6 +151,16 @@ TEST_F(Framing, RefusedJobDropsItsChunkAndTheNextChunkTriesAgain) {
     ExpectJobs({Framed("accepted")});
 }
 
+TEST_F(Framing, RefusedJobDropsAUelCutAtItsEndWithIt) {
+    // The refused chunk ends in a cut UEL behind eleven bytes of data; the next,
+    // shorter chunk has no escape and is a job of its own, as it is.
+    rec::RegisterAnswer() = -1;
+    Send({"longer data\x1b%"}, false);
+    rec::RegisterAnswer() = 1;
+    Send({"ab"});
+    ExpectJobs({"ab"});
+}
+
 TEST_F(Framing, HostApplicationBetweenJobsIsNotPrintData) {
     // An ND packet of header only, between two print jobs.
     std::string nd = {'\x1b', '\x91', 0, 0, 0, 0, 0, 0x0D, 0, 0, 0, 0, 0, 0, 0, 0};
