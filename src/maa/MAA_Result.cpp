@@ -1,6 +1,7 @@
 #include "maa/MAA_Result.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -215,10 +216,18 @@ TMAAResult *Dump_File(U32 ulPath) {
     // The host names a file of the controller: under USBADAPTER_ROOT on a PC.
     const char *name = MAA_AddrString(ulPath);
     const std::string path = name != nullptr ? FixedPath(name) : std::string();
-    UniqueFd fd(name != nullptr ? ::open(path.c_str(), O_RDONLY) : -1);
+    // Text files only: a device such as /dev/zero never ends, and a pipe or
+    // /proc/kmsg would keep the shell waiting (hence no blocking, either).
+    UniqueFd fd(name != nullptr ? ::open(path.c_str(), O_RDONLY | O_NONBLOCK) : -1);
+    struct stat st;
+    if (fd && (::fstat(fd.get(), &st) != 0 || !S_ISREG(st.st_mode))) fd.reset();
     if (!fd) return dumpResult(MAA_RESULT_END, 0, "File Open Error %s", name ? name : "");
     USBADP_LOG(INFO, "\r\nFile Dump Start");
     for (;;) {
+        if (MAA_IsUSBDisconnected()) {
+            USBADP_LOG(ERROR, "\r\n[MAA] Dump_File: cable disconnected, dump stopped");
+            break;
+        }
         U32 len = ReadFileByLine(fd.get(), aubDumpLine, sizeof aubDumpLine);
         if (len == 0) break;
         USBADP_LOG(DEBUG, "%s\n", aubDumpLine);

@@ -2,6 +2,7 @@
 // packet socket keeps each write apart), Dump_File, and the start-up files.
 #include <sys/msg.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 
 #include <csignal>
@@ -156,6 +157,45 @@ TEST_F(ResultTest, DumpFileSendsLinesUntilTheFirstEmptyOne) {
         EXPECT_EQ(res->ulResult, r.result);
         EXPECT_EQ(std::string(reinterpret_cast<char *>(res->pubData), res->ulDataSize), r.last);
     }
+}
+
+TEST_F(ResultTest, DumpFileRefusesWhatIsNoTextFileAndStopsWhenTheHostIsGone) {
+    TempRoot root;
+    // An endless device and a pipe nobody writes: the answer is the open error,
+    // at once. Each runs in a child that a hang cannot outlive.
+    std::filesystem::create_symlink("/dev/zero", root / "/halvard/zero");
+    ASSERT_EQ(::mkfifo((root / "/halvard/fifo").c_str(), 0600), 0);
+    for (std::string path : {"/halvard/zero", "/halvard/fifo"}) {
+        SCOPED_TRACE(path);
+        const U32 address = MAA_AddrMap(path.data(), static_cast<U32>(path.size() + 1));
+        const pid_t pid = ::fork();
+        ASSERT_GE(pid, 0);
+        if (pid == 0) {
+            ::alarm(5);
+            TMAAResult *res = Dump_File(address);
+            const bool refused = res != nullptr && res->ulResult == 0 && res->enContinue == MAA_RESULT_END &&
+                                 std::string(reinterpret_cast<char *>(res->pubData), res->ulDataSize) ==
+                                     "File Open Error " + path;
+            ::_exit(refused ? 0 : 1);
+        }
+        int status = 0;
+        ASSERT_EQ(::waitpid(pid, &status, 0), pid);
+        EXPECT_FALSE(WIFSIGNALED(status)) << "still dumping after 5 s";
+        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "not answered with the open error";
+        EXPECT_TRUE(Writes().empty());
+        MAA_AddrUnmap(address);
+    }
+
+    // A long file for a host that has gone: the dump stops instead of reading on.
+    std::string path = "/halvard/long.txt";
+    {
+        std::ofstream out(root / path);
+        for (int i = 0; i < 1000; ++i) out << "line " << i << "\n";
+    }
+    IsDisconnected = 1;
+    Dump_File(MAA_AddrMap(path.data(), static_cast<U32>(path.size() + 1)));
+    EXPECT_EQ(LoggerHost_Count("\r\n[MAA] Dump_File: cable disconnected, dump stopped"), 1);
+    EXPECT_TRUE(Writes().empty());
 }
 
 TEST(StartUp, UsbSpeedFileGetsHighWithoutTruncation) {
