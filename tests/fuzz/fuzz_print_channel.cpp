@@ -1,0 +1,524 @@
+// Arbitrary host traffic on the print channel, sent the way a USB host sends
+// it: the reader's turns, the data classifier, the application checkers and
+// the test shell, over the emulated print node with instant time-outs. Java is
+// replaced by a delivery that checks what Java would be handed.
+//
+// Input: byte 0 chooses Java's answers (bits 0-1: RegisterJob refusals, bits
+// 2-4: which application call fails); the rest is the host's traffic, in which
+//   FE FF  ends a host transfer (a read never returns bytes of two), and
+//   FE FE  ends a phase: the host sends a phase's transfers back to back, then
+//          waits until the device has taken them all and waits for more (any
+//          poll times out) before it sends the next phase.
+// When the last phase has been taken and the device still waits for the host
+// inside a turn (a test-shell session, an application body), the host pulls
+// the cable. A turn that still waits after that, or that runs for more than
+// kTurnLimit, aborts as a hang, so libFuzzer keeps the input. With
+// FUZZ_PRINT_CHANNEL_STRICT=1 in the environment, needing the cable pull at
+// all aborts instead: that lists the inputs that hold the channel until the
+// host goes away. FUZZ_PRINT_CHANNEL_VERBOSE=1 prints what each input did.
+//
+// The shell has a few functions of its own here (no device access) besides
+// MAA_SymbolDump and Dump_File, whose files lie under a private
+// USBADAPTER_ROOT ("/t" is a short text).
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <mutex>
+#include <string>
+#include <string_view>
+#include <thread>
+#include <vector>
+
+#include "adapter/Classifier.h"
+#include "adapter/USB.h"
+#include "adapter/prn_thread.h"
+#include "maa/MAA_Address.h"
+#include "maa/MAA_Hook.h"
+#include "maa/MAA_IF.h"
+#include "maa/MAA_MM.h"
+#include "maa/MAA_Result.h"
+#include "maa/MAA_Symbol.h"
+#include "print/USBPrint.h"
+#include "support/TempRoot.h"
+#include "vdev.h"
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+constexpr auto kTurnLimit = std::chrono::seconds(5);
+constexpr auto kHangAfterPull = std::chrono::seconds(1);
+// Polls and reads in a row with nothing pending before the device counts as
+// waiting for the host. Only the retry loops get there.
+constexpr size_t kIdleCalls = 64;
+constexpr size_t kControllerAllocLimit = size_t{256} << 20;
+
+[[noreturn]] void fail(const char *what) {
+    std::fprintf(stderr, "\n== fuzz_print_channel: %s\n", what);
+    std::abort();
+}
+#define CHECK(cond, what)        \
+    do {                         \
+        if (!(cond)) fail(what); \
+    } while (0)
+
+// ---- Java's side ----------------------------------------------------------
+
+struct Answers {
+    U8 registerPolicy;  // 0 accept, 1 refuse the first, 2 refuse every second, 3 refuse all
+    U8 appFailure;      // 0 none, 1 SendAppType, 2 header SendAppBuf, 3 body SendAppBuf, 4 NotifyAppEnd
+};
+
+struct Java {
+    Answers answers{};
+    bool acceptAll = false;  // the closing turns: no more refusals
+    size_t registrations = 0, refusals = 0;
+    bool jobOpen = false;
+    std::string printed;  // every byte passed, in order
+    bool appOpen = false;
+    std::string appType;
+    size_t appBufCalls = 0, appBytes = 0, appEvents = 0;
+} java;
+
+void touch(const U8 *p, S32 len, std::string *into) {
+    // Reading every byte lets ASan check the range lies inside one buffer.
+    if (into) into->append(reinterpret_cast<const char *>(p), static_cast<size_t>(len));
+    else {
+        volatile U8 sink = 0;
+        for (S32 i = 0; i < len; ++i) sink = sink ^ p[i];
+    }
+}
+
+S8 RegisterJob(const char *name) {
+    CHECK(name != nullptr && std::strlen(name) < sizeof PrndataFileName, "RegisterJob without a file name");
+    size_t n = java.registrations++;
+    bool refuse = false;
+    if (!java.acceptAll) {
+        switch (java.answers.registerPolicy) {
+        case 1: refuse = n == 0; break;
+        case 2: refuse = n % 2 == 1; break;
+        case 3: refuse = true; break;
+        default: break;
+        }
+    }
+    if (refuse) {
+        ++java.refusals;
+        return -1;
+    }
+    CHECK(!java.jobOpen, "a job was registered while another was open");
+    java.jobOpen = true;
+    return 1;
+}
+
+void PassData(U8 *data, S32 len) {
+    CHECK(len >= 0, "PassData with a negative length");
+    CHECK(len <= TEMP2_UEL_SEND_BUFFER_SIZE, "PassData longer than the reader's buffers");
+    CHECK(data != nullptr || len == 0, "PassData without data");
+    CHECK(java.jobOpen, "data passed with no job open");
+    touch(data, len, &java.printed);
+}
+
+void NotifyEndOfData() {
+    CHECK(java.jobOpen, "a job was ended that was not open");
+    java.jobOpen = false;
+}
+
+bool appFails(U8 point) { return java.answers.appFailure == point; }
+
+S32 SendAppType(const char *type) {
+    CHECK(type != nullptr && *type != 0 && std::strlen(type) < 32, "SendAppType without a type");
+    ++java.appEvents;
+    java.appOpen = false;
+    if (appFails(1)) return -1;
+    java.appOpen = true;
+    java.appType = type;
+    java.appBufCalls = 0;
+    return 0;
+}
+
+S32 SendAppBuf(const char *type, U8 *buf, S32 len) {
+    ++java.appEvents;
+    CHECK(java.appOpen, "SendAppBuf with no application stream");
+    CHECK(type != nullptr && java.appType == type, "SendAppBuf for another application");
+    CHECK(len >= 0 && (buf != nullptr || len == 0), "SendAppBuf with a bad buffer");
+    touch(buf, len, nullptr);
+    java.appBytes += static_cast<size_t>(len);
+    size_t call = ++java.appBufCalls;
+    if ((call == 1 && appFails(2)) || (call == 2 && appFails(3))) return -1;
+    return 0;
+}
+
+S32 NotifyAppEnd(const char *type) {
+    ++java.appEvents;
+    CHECK(java.appOpen, "NotifyAppEnd with no application stream");
+    CHECK(type != nullptr && java.appType == type, "NotifyAppEnd for another application");
+    if (appFails(4)) return -1;
+    java.appOpen = false;
+    return 0;
+}
+
+const TPrintDelivery kJava = {RegisterJob, PassData, NotifyEndOfData, SendAppType, SendAppBuf, NotifyAppEnd};
+
+// ---- the test shell's functions --------------------------------------------
+
+TMAAResult stResult;
+U8 aubDone[] = "done";
+U32 ulX, ulY;
+volatile U32 ulSink;
+
+TMAAResult *done(TMAAResultStatus status) {
+    stResult = {status, 1, 4, aubDone};
+    return &stResult;
+}
+void useText(U32 word) {
+    if (word > 1000000) {
+        if (const char *t = MAA_AddrString(word)) ulSink = ulSink + static_cast<U32>(std::strlen(t));
+    }
+}
+TMAAResult *f0() { return done(MAA_RESULT_END); }
+TMAAResult *f2(U32 a, U32 b) {
+    useText(a);
+    useText(b);
+    return done(MAA_RESULT_CONTINUE);
+}
+TMAAResult *none1(U32 a) {
+    useText(a);
+    return done(MAA_RESULT_NONE);
+}
+TMAAResult *scan3(U32 a, U32 b, U32 c) {
+    MAA_IF_WriteResult(done(MAA_RESULT_CONTINUE));
+    MAA_IF_SkipResult();
+    return done(static_cast<TMAAResultStatus>((a + b + c) % 3));
+}
+TMAAResult *f10(U32 a, U32, U32, U32, U32, U32, U32, U32, U32, U32 j) {
+    useText(a);
+    useText(j);
+    return nullptr;
+}
+TMAAResult *general(U32 argc, U32 *args) {
+    for (U32 i = 0; i < argc; ++i) useText(args[i]);
+    return done(MAA_RESULT_END);
+}
+// The host's last download, sent back as a file (first 64 KiB).
+TMAAResult *echoDownload() {
+    U32 size = 0;
+    const U8 *p = MAA_DownloadBuffer(&size);
+    MAA_IF_WriteFile(p, p ? std::min<U32>(size, 64 * 1024) : 0);
+    MAA_IF_FileEnd();
+    return done(MAA_RESULT_END);
+}
+// The host's last download taken as ready-made frames (first 8 KiB).
+TMAAResult *forwardDownload() {
+    U32 size = 0;
+    U8 *p = MAA_DownloadBuffer(&size);
+    if (p) MAA_WriteFileForward(p, std::min<U32>(size, 8 * 1024));
+    return done(MAA_RESULT_NONE);
+}
+
+void registerSymbols() {
+    MAA_SymbolAdd(ftarget_all, "MAA_SymbolDump", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<MAA_SymbolDump>(), 0);
+    MAA_SymbolAdd(ftarget_ppc, "f", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<f0>(), 0);
+    MAA_SymbolAdd(ftarget_ppc, "g", MAA_SYM_FUNC, MAA_FuncEntry<f2>(), 2);
+    MAA_SymbolAdd(ftarget_ppc, "h", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<none1>(), 1);
+    MAA_SymbolAdd(ftarget_scn, "s", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<scan3>(), 3);
+    MAA_SymbolAdd(ftarget_ppc, "t", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<f10>(), 10);
+    MAA_SymbolAdd(ftarget_ppc, "dl", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<echoDownload>(), 0);
+    MAA_SymbolAdd(ftarget_ppc, "fw", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<forwardDownload>(), 0);
+    MAA_SymbolAdd(ftarget_ppc, "Dump_File", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<Dump_File>(), 1);
+    MAA_SymbolAdd(ftarget_ppc, "x", MAA_SYM_DATA, MAA_AddrMap(&ulX, 4), 0);
+    MAA_SymbolAdd(ftarget_ppc, "y", MAA_SYM_DATA, MAA_AddrMap(&ulY, 4), 0);
+    MAA_SymbolAdd(ftarget_ppc, "u", MAA_SYM_UNDEF, 0x7FFFFFF0, 0);
+    MAA_SymbolAddGeneral(ftarget_ppc, "MAA_GENERAL_FUNCTION", MAA_SYM_FUNC_HIDE, MAA_AddrGeneralHandle(&general), 2);
+}
+
+// ---- the host --------------------------------------------------------------
+
+using Phase = std::vector<std::string>;
+
+// Shared with the watcher: the phases still to send and the turn in progress.
+std::mutex hostMu;
+std::vector<Phase> phases;
+size_t nextPhase = 0;
+bool pulled = false;
+uint64_t turn = 0;  // odd while the reader is inside a turn
+Clock::time_point turnStart;
+bool strict = false;
+bool verbose = false;
+
+// With hostMu held.
+void sendNextPhase() {
+    for (const std::string &t : phases[nextPhase]) vdev::HostWrite(vdev::kPrn, t.data(), t.size());
+    ++nextPhase;
+}
+
+// The host's patience: it sends the next phase when the device waits for
+// more, pulls the cable when it has nothing left to send, and reports a turn
+// that never returns.
+void watcher() {
+    uint64_t seen = 0;
+    size_t base = 0, pending = 0;
+    Clock::time_point pulledAt;
+    bool inTurn = false;
+    for (;;) {
+        // Closer looks while a turn runs: each wait for the host costs the
+        // input that much time.
+        std::this_thread::sleep_for(std::chrono::microseconds(inTurn ? 50 : 200));
+        std::lock_guard lk(hostMu);
+        inTurn = turn & 1;
+        if (!inTurn) continue;
+        size_t calls = vdev::PollCalls(vdev::kPrn) + vdev::ReadCalls(vdev::kPrn);
+        size_t p = vdev::PendingHostBytes(vdev::kPrn);
+        Clock::time_point now = Clock::now();
+        if (turn != seen) {
+            seen = turn;
+            base = calls;
+            pending = p;
+            continue;
+        }
+        if (now - turnStart > kTurnLimit) fail("a reader turn did not return (hang)");
+        if (p != 0 || p != pending) {
+            pending = p;
+            base = calls;
+            continue;
+        }
+        if (calls - base < kIdleCalls) continue;
+        base = calls;
+        if (nextPhase < phases.size()) {
+            sendNextPhase();
+            pending = vdev::PendingHostBytes(vdev::kPrn);
+        } else if (!pulled) {
+            if (strict) fail("the device waits for the host without bound (strict mode)");
+            pulled = true;
+            pulledAt = now;
+            IsDisconnected = 1;
+        } else if (now - pulledAt > kHangAfterPull) {
+            fail("the device still waits for the host after the cable was pulled (hang)");
+        }
+    }
+}
+
+void readerTurn() {
+    {
+        std::lock_guard lk(hostMu);
+        ++turn;
+        turnStart = Clock::now();
+    }
+    USBAdapter_ReadPass();
+    std::lock_guard lk(hostMu);
+    ++turn;
+}
+
+// ---- per input ---------------------------------------------------------------
+
+// Frees what an input left behind, so each input's allocations are its own
+// (libFuzzer's leak check compares them) and the next input starts afresh.
+void cleanUp() {
+    if (fdPrn > 0) ::close(fdPrn);
+    fdPrn = 0;
+    vdev::Reset();
+    IsDisconnected = 0;
+    hibernation_flag = 0;
+    MAA_HeapFree(stCmdHeap.ulHeapPtr, 0);
+    stCmdHeap = {};
+    MAA_HeapFree(stDataHeap.ulHeapPtr, 0);
+    stDataHeap = {};
+    Request_MAA_CommandH2T(0);  // drops the download
+    MAA_SetResultWriter(nullptr);
+    MAA_SymbolClear();
+    MAA_AddrReset();
+    java = Java{};
+    std::lock_guard lk(hostMu);
+    phases = {};
+    nextPhase = 0;
+    pulled = false;
+}
+
+void setUp() {
+    fdPrn = ::open(vdev::kPrn, O_RDWR);
+    CHECK(fdPrn > 0, "the print node does not open");
+    vdev::SetInstantTimeouts(vdev::kPrn, true);
+
+    InitializeVars();
+    slPollTimeout = POLL_TIMEOUT_IDLE;
+    splitPatternMarker = 0;
+    UelPosition = 0;
+    restData = 0;
+    dataEnd = 0;
+
+    maa_session::slPollTimeout = MAA_POLL_TIMEOUT_FIRST;
+    enSpecialMode = MAA_NORMAL_CMD;
+    fSellStop = 0;
+    ulReadCount = 0;
+    dataReadCount = 0;
+    std::memset(aubBuf, 0, sizeof aubBuf);
+    registerSymbols();
+}
+
+// Splits the traffic into phases of transfers; returns every host byte in order.
+std::string parse(const uint8_t *d, size_t n, std::vector<Phase> &out, size_t &transfers) {
+    std::string all, cur;
+    out.assign(1, {});
+    transfers = 0;
+    // A transfer separator always ends a transfer (two in a row send an empty
+    // one); a phase separator ends one only if it holds bytes.
+    auto push = [&](bool evenEmpty) {
+        if (cur.empty() && !evenEmpty) return;
+        all += cur;
+        out.back().push_back(std::move(cur));
+        cur.clear();
+        ++transfers;
+    };
+    for (size_t i = 0; i < n; ++i) {
+        if (d[i] == 0xFE && i + 1 < n && (d[i + 1] == 0xFF || d[i + 1] == 0xFE)) {
+            push(d[i + 1] == 0xFF);
+            if (d[i + 1] == 0xFE) out.emplace_back();
+            ++i;
+            continue;
+        }
+        cur.push_back(static_cast<char>(d[i]));
+    }
+    push(false);
+    return all;
+}
+
+bool contains(std::string_view hay, std::string_view needle) { return hay.find(needle) != std::string_view::npos; }
+
+size_t count(std::string_view hay, std::string_view needle) {
+    size_t c = 0;
+    for (size_t p = hay.find(needle); p != std::string_view::npos; p = hay.find(needle, p + 1)) ++c;
+    return c;
+}
+
+bool isSubsequence(std::string_view part, std::string_view whole) {
+    size_t j = 0;
+    for (char c : part) {
+        while (j < whole.size() && whole[j] != c) ++j;
+        if (j == whole.size()) return false;
+        ++j;
+    }
+    return true;
+}
+
+// Bytes the host sent that ask the device to answer on the print channel.
+bool asksForAnswer(std::string_view host) {
+    if (contains(host, std::string_view("\x1bwMAASTART", 10))) return true;
+    for (size_t p = host.find('\x1b'); p != std::string_view::npos && p + 1 < host.size(); p = host.find('\x1b', p + 1)) {
+        switch (static_cast<U8>(host[p + 1])) {
+        case 0x24: case 0x91: case 0x9A: case 0xA8: case 0xAA: return true;
+        default: break;
+        }
+    }
+    return false;
+}
+
+}  // namespace
+
+// The controller is a 32-bit machine: an allocation of the size a host may
+// announce (up to 2 GiB for an application body) fails there. This target is
+// linked with malloc wrapped (tests/fuzz/CMakeLists.txt), so that such an
+// allocation fails here too, quietly: the product's allocation-failure paths
+// run, and each input stays fast.
+extern "C" void *__real_malloc(size_t size);
+extern "C" void *__wrap_malloc(size_t size) {
+    if (size > kControllerAllocLimit) {
+        errno = ENOMEM;
+        return nullptr;
+    }
+    return __real_malloc(size);
+}
+
+extern "C" int LLVMFuzzerInitialize(int *, char ***) {
+    setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
+    const char *s = std::getenv("FUZZ_PRINT_CHANNEL_STRICT");
+    strict = s != nullptr && *s == '1';
+    const char *v = std::getenv("FUZZ_PRINT_CHANNEL_VERBOSE");
+    verbose = v != nullptr && *v == '1';
+    // The controller's files, for Dump_File: a short text at "/t".
+    static TempRoot root;
+    if (FILE *f = std::fopen((root / "/t").c_str(), "w")) {
+        std::fputs("first line\nsecond line\n\nafter the empty line\n", f);
+        std::fclose(f);
+    }
+    USBPrint_SetDelivery(&kJava);
+    if (USBAdapter_AllocateReadBuffers() != 1) fail("the reader's buffers cannot be allocated");
+    cleanUp();
+    std::thread(watcher).detach();
+    return 0;
+}
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
+    if (size == 0) return 0;
+    setUp();
+    java.answers = {static_cast<U8>(data[0] & 3), static_cast<U8>((data[0] >> 2) & 7)};
+
+    std::vector<Phase> parsed;
+    size_t transfers = 0;
+    const std::string host = parse(data + 1, size - 1, parsed, transfers);
+    {
+        std::lock_guard lk(hostMu);
+        phases = std::move(parsed);
+        nextPhase = 0;
+        pulled = false;
+        sendNextPhase();
+    }
+
+    // Turns until the host has sent everything and the device has taken it.
+    // Every turn with data pending takes at least one byte or one transfer.
+    const size_t limit = host.size() + transfers + 2 * phases.size() + 16;
+    for (size_t n = 0;; ++n) {
+        CHECK(n <= limit, "the reader stopped taking host data");
+        readerTurn();
+        if (vdev::PendingHostBytes(vdev::kPrn) > 0) continue;
+        bool more;
+        {
+            std::lock_guard lk(hostMu);
+            more = nextPhase < phases.size();
+        }
+        if (!more) break;
+        // The host's pause: a turn with nothing to take, then the next phase.
+        readerTurn();
+        std::lock_guard lk(hostMu);
+        if (nextPhase < phases.size()) sendNextPhase();
+    }
+
+    // The host is gone or quiet for good: what is open must end.
+    IsDisconnected = 0;
+    java.acceptAll = true;
+    readerTurn();
+    for (int i = 0; i < 4 && (readFlag != 0 || startUELFlag != 0); ++i) readerTurn();
+    CHECK(readFlag == 0 && startUELFlag == 0, "the reader is not idle after the host went quiet");
+    CHECK(!java.jobOpen, "a job was never ended");
+    CHECK(vdev::PendingHostBytes(vdev::kPrn) == 0, "host bytes left unread");
+
+    // Nothing is delivered that the host did not send: only a short ESC 0x91
+    // header is padded with zeros (at most 14 per header).
+    const size_t padding = 14 * count(host, std::string_view("\x1b\x91", 2));
+    CHECK(java.printed.size() + java.appBytes <= host.size() + padding, "more bytes delivered than the host sent");
+    if (padding == 0) {
+        CHECK(java.appEvents == 0, "an application transfer without an application header");
+        CHECK(isSubsequence(java.printed, host), "print data not in the order the host sent it");
+    }
+    // Without ESC no byte selects anything: all of it is print data, unchanged.
+    if (java.refusals == 0 && host.find('\x1b') == std::string::npos)
+        CHECK(java.printed == host, "print data lost or changed");
+
+    std::vector<uint8_t> wire = vdev::HostRead(vdev::kPrn);
+    if (!wire.empty()) CHECK(asksForAnswer(host), "the device wrote to the host unasked");
+    if (verbose) {
+        std::fprintf(stderr,
+                     "host %zu bytes in %zu transfers, %zu phases; jobs %zu (refused %zu), printed %zu; "
+                     "application calls %zu (%zu bytes); device wrote %zu; cable pulled %d\n",
+                     host.size(), transfers, phases.size(), java.registrations, java.refusals, java.printed.size(),
+                     java.appEvents, java.appBytes, wire.size(), pulled ? 1 : 0);
+    }
+    cleanUp();
+    return 0;
+}
