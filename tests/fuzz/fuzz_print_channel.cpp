@@ -46,6 +46,7 @@
 #include "maa/MAA_MM.h"
 #include "maa/MAA_Result.h"
 #include "maa/MAA_Symbol.h"
+#include "ShellProbes.h"
 #include "print/USBPrint.h"
 #include "support/TempRoot.h"
 #include "vdev.h"
@@ -169,74 +170,28 @@ const TPrintDelivery kJava = {RegisterJob, PassData, NotifyEndOfData, SendAppTyp
 
 // ---- the test shell's functions --------------------------------------------
 
-TMAAResult stResult;
-U8 aubDone[] = "done";
-U32 ulX, ulY;
-volatile U32 ulSink;
-
-TMAAResult *done(TMAAResultStatus status) {
-    stResult = {status, 1, 4, aubDone};
-    return &stResult;
-}
-void useText(U32 word) {
-    if (word > 1000000) {
-        if (const char *t = MAA_AddrString(word)) ulSink = ulSink + static_cast<U32>(std::strlen(t));
-    }
-}
-TMAAResult *f0() { return done(MAA_RESULT_END); }
-TMAAResult *f2(U32 a, U32 b) {
-    useText(a);
-    useText(b);
-    return done(MAA_RESULT_CONTINUE);
-}
-TMAAResult *none1(U32 a) {
-    useText(a);
-    return done(MAA_RESULT_NONE);
-}
-TMAAResult *scan3(U32 a, U32 b, U32 c) {
-    MAA_IF_WriteResult(done(MAA_RESULT_CONTINUE));
-    MAA_IF_SkipResult();
-    return done(static_cast<TMAAResultStatus>((a + b + c) % 3));
-}
-TMAAResult *f10(U32 a, U32, U32, U32, U32, U32, U32, U32, U32, U32 j) {
-    useText(a);
-    useText(j);
-    return nullptr;
-}
-TMAAResult *general(U32 argc, U32 *args) {
-    for (U32 i = 0; i < argc; ++i) useText(args[i]);
-    return done(MAA_RESULT_END);
-}
 // The host's last download, sent back as a file (first 64 KiB).
 TMAAResult *echoDownload() {
     U32 size = 0;
     const U8 *p = MAA_DownloadBuffer(&size);
     MAA_IF_WriteFile(p, p ? std::min<U32>(size, 64 * 1024) : 0);
     MAA_IF_FileEnd();
-    return done(MAA_RESULT_END);
+    return probes::done(MAA_RESULT_END);
 }
 // The host's last download taken as ready-made frames (first 8 KiB).
 TMAAResult *forwardDownload() {
     U32 size = 0;
     U8 *p = MAA_DownloadBuffer(&size);
     if (p) MAA_WriteFileForward(p, std::min<U32>(size, 8 * 1024));
-    return done(MAA_RESULT_NONE);
+    return probes::done(MAA_RESULT_NONE);
 }
 
 void registerSymbols() {
-    MAA_SymbolAdd(ftarget_all, "MAA_SymbolDump", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<MAA_SymbolDump>(), 0);
-    MAA_SymbolAdd(ftarget_ppc, "f", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<f0>(), 0);
-    MAA_SymbolAdd(ftarget_ppc, "g", MAA_SYM_FUNC, MAA_FuncEntry<f2>(), 2);
-    MAA_SymbolAdd(ftarget_ppc, "h", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<none1>(), 1);
-    MAA_SymbolAdd(ftarget_scn, "s", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<scan3>(), 3);
-    MAA_SymbolAdd(ftarget_ppc, "t", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<f10>(), 10);
-    MAA_SymbolAdd(ftarget_ppc, "dl", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<echoDownload>(), 0);
-    MAA_SymbolAdd(ftarget_ppc, "fw", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<forwardDownload>(), 0);
-    MAA_SymbolAdd(ftarget_ppc, "Dump_File", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<Dump_File>(), 1);
-    MAA_SymbolAdd(ftarget_ppc, "x", MAA_SYM_DATA, MAA_AddrMap(&ulX, 4), 0);
-    MAA_SymbolAdd(ftarget_ppc, "y", MAA_SYM_DATA, MAA_AddrMap(&ulY, 4), 0);
-    MAA_SymbolAdd(ftarget_ppc, "u", MAA_SYM_UNDEF, 0x7FFFFFF0, 0);
-    MAA_SymbolAddGeneral(ftarget_ppc, "MAA_GENERAL_FUNCTION", MAA_SYM_FUNC_HIDE, MAA_AddrGeneralHandle(&general), 2);
+    probes::Register([] {
+        MAA_SymbolAdd(ftarget_ppc, "dl", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<echoDownload>(), 0);
+        MAA_SymbolAdd(ftarget_ppc, "fw", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<forwardDownload>(), 0);
+        MAA_SymbolAdd(ftarget_ppc, "Dump_File", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<Dump_File>(), 1);
+    });
 }
 
 // ---- the host --------------------------------------------------------------

@@ -1,0 +1,69 @@
+// Harmless test-shell functions for the fuzz targets: every arity, every
+// result kind, a scanner-side function, text arguments read through the
+// address map, data cells, an undefined symbol and the general function.
+#pragma once
+
+#include <cstring>
+
+#include "maa/MAA_Address.h"
+#include "maa/MAA_IF.h"
+#include "maa/MAA_Symbol.h"
+
+namespace probes {
+
+inline TMAAResult stResult;
+inline U8 aubDone[] = "done";
+inline U32 ulX, ulY;
+inline volatile U32 ulSink;
+
+inline TMAAResult *done(TMAAResultStatus status) {
+    stResult = {status, 1, 4, aubDone};
+    return &stResult;
+}
+// Touches a text argument the way test functions do.
+inline void useText(U32 word) {
+    if (word > 1000000) {
+        if (const char *t = MAA_AddrString(word)) ulSink = ulSink + static_cast<U32>(std::strlen(t));
+    }
+}
+inline TMAAResult *f0() { return done(MAA_RESULT_END); }
+inline TMAAResult *f2(U32 a, U32 b) {
+    useText(a);
+    useText(b);
+    return done(MAA_RESULT_CONTINUE);
+}
+inline TMAAResult *none1(U32 a) {
+    useText(a);
+    return done(MAA_RESULT_NONE);
+}
+inline TMAAResult *scan3(U32 a, U32 b, U32 c) {
+    MAA_IF_WriteResult(done(MAA_RESULT_CONTINUE));
+    MAA_IF_SkipResult();
+    return done(static_cast<TMAAResultStatus>((a + b + c) % 3));
+}
+inline TMAAResult *f10(U32 a, U32, U32, U32, U32, U32, U32, U32, U32, U32 j) {
+    useText(a);
+    useText(j);
+    return nullptr;
+}
+inline TMAAResult *general(U32 argc, U32 *args) {
+    for (U32 i = 0; i < argc; ++i) useText(args[i]);
+    return done(MAA_RESULT_END);
+}
+
+// Registers the probes (the general function last, as the registry does).
+inline void Register(void (*extra)() = nullptr) {
+    MAA_SymbolAdd(ftarget_all, "MAA_SymbolDump", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<MAA_SymbolDump>(), 0);
+    MAA_SymbolAdd(ftarget_ppc, "f", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<f0>(), 0);
+    MAA_SymbolAdd(ftarget_ppc, "g", MAA_SYM_FUNC, MAA_FuncEntry<f2>(), 2);
+    MAA_SymbolAdd(ftarget_ppc, "h", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<none1>(), 1);
+    MAA_SymbolAdd(ftarget_scn, "s", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<scan3>(), 3);
+    MAA_SymbolAdd(ftarget_ppc, "t", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<f10>(), 10);
+    if (extra) extra();
+    MAA_SymbolAdd(ftarget_ppc, "x", MAA_SYM_DATA, MAA_AddrMap(&ulX, 4), 0);
+    MAA_SymbolAdd(ftarget_ppc, "y", MAA_SYM_DATA, MAA_AddrMap(&ulY, 4), 0);
+    MAA_SymbolAdd(ftarget_ppc, "u", MAA_SYM_UNDEF, 0x7FFFFFF0, 0);
+    MAA_SymbolAddGeneral(ftarget_ppc, "MAA_GENERAL_FUNCTION", MAA_SYM_FUNC_HIDE, MAA_AddrGeneralHandle(&general), 2);
+}
+
+}  // namespace probes
