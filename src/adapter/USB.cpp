@@ -199,7 +199,9 @@ extern "C" void PrnScanSighandler(int) {
         IsDisconnected = 0;
         if (bootUpFlag != 1) {
             sent = sendRouted(MFP_DEV_CONFIGURED, slprintFlag, slscanFlag, slcommonFlag);
-            bootUpFlag = 1;
+            // Only a configuration that reached the reader counts: the next one
+            // is forwarded again, or the reader would never start.
+            if (sent) bootUpFlag = 1;
         } else {
             USBADP_LOG_ASYNC(INFO, "[USBAdp] [print thread] bootUpFlag == 1\n");
         }

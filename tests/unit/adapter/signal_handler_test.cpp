@@ -98,6 +98,19 @@ TEST_F(SignalHandler, OnlyTheFirstConfigurationIsForwarded) {
     EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] bootUpFlag == 1\n"), 1);
 }
 
+TEST_F(SignalHandler, ConfigurationThatCouldNotBePostedIsForwardedAgain) {
+    RemoveQueue(globalPrnMsgQ);
+    Deliver(MFP_DEV_CONFIGURED, eMfp_Notif_Prn);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Can't send message through Prn_MsgQ message queue.\n"), 1);
+    EXPECT_EQ(bootUpFlag.load(), 0);
+
+    // The queue is back (the service re-created it); the host configures again.
+    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
+    Deliver(MFP_DEV_CONFIGURED, eMfp_Notif_Prn);
+    EXPECT_EQ(Print(), MFP_DEV_CONFIGURED);
+    EXPECT_EQ(bootUpFlag.load(), 1);
+}
+
 TEST_F(SignalHandler, DisconnectPostsNothingAndFlipsTheFlags) {
     IsConfigured = 1;
     Deliver(MFP_DEV_DISCONNECT, eMfp_Notif_Both);
