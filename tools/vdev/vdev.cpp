@@ -199,6 +199,7 @@ struct NodeState {
     std::vector<int> pollTimeouts;
     std::vector<size_t> readSizes;
     size_t pollCalls = 0, readCalls = 0;
+    size_t expiredPolls = 0;  // polls that returned 0
     std::vector<int> openFds;  // oldest first
     int lastFlags = 0;
     std::optional<int> forcedFlags;
@@ -296,6 +297,16 @@ size_t TakeTransfer(NodeState &n, void *buf, size_t size) {
         n.marker = false;
     }
     return got;
+}
+
+void DropTransfers(NodeState &n) {
+    n.rx.clear();
+    n.rxOffset = 0;
+    if (n.marker) {
+        char m;
+        (void)recv(n.devEnd.get(), &m, 1, MSG_DONTWAIT);
+        n.marker = false;
+    }
 }
 
 void RemoveOpenFd(NodeState &n, int fd) {
@@ -553,22 +564,11 @@ int Ioctl(int fd, uint32_t entry, unsigned long request, void *arg) {
     return r;
 }
 
-int Poll(struct pollfd *fds, nfds_t count, int timeout) {
+namespace {
+
+// The wait of Poll once its nodes are known (and recorded).
+int PollNodes(struct pollfd *fds, nfds_t count, int timeout, const std::vector<int> &nodes) {
     Model &m = M();
-    std::vector<int> nodes;
-    {
-        std::lock_guard lk(m.mu);
-        for (nfds_t i = 0; i < count; ++i) {
-            uint32_t e = FdEntry(fds[i].fd);
-            if (!e || !LiveFd(m, fds[i].fd, e)) continue;
-            int node = EntryNode(e);
-            if (std::find(nodes.begin(), nodes.end(), node) != nodes.end()) continue;
-            nodes.push_back(node);
-            m.nodes[node].pollTimeouts.push_back(timeout);
-            Bound(m.nodes[node].pollTimeouts);
-            ++m.nodes[node].pollCalls;
-        }
-    }
     int64_t deadline = timeout < 0 ? -1 : NowMs() + timeout;
     std::vector<pollfd> ext;
     for (;;) {
@@ -606,6 +606,32 @@ int Poll(struct pollfd *fds, nfds_t count, int timeout) {
     }
 }
 
+}  // namespace
+
+int Poll(struct pollfd *fds, nfds_t count, int timeout) {
+    Model &m = M();
+    std::vector<int> nodes;
+    {
+        std::lock_guard lk(m.mu);
+        for (nfds_t i = 0; i < count; ++i) {
+            uint32_t e = FdEntry(fds[i].fd);
+            if (!e || !LiveFd(m, fds[i].fd, e)) continue;
+            int node = EntryNode(e);
+            if (std::find(nodes.begin(), nodes.end(), node) != nodes.end()) continue;
+            nodes.push_back(node);
+            m.nodes[node].pollTimeouts.push_back(timeout);
+            Bound(m.nodes[node].pollTimeouts);
+            ++m.nodes[node].pollCalls;
+        }
+    }
+    int r = PollNodes(fds, count, timeout, nodes);
+    if (r == 0 && timeout != 0) {
+        std::lock_guard lk(m.mu);
+        for (int node : nodes) ++m.nodes[node].expiredPolls;
+    }
+    return r;
+}
+
 }  // namespace vdev::detail
 
 // ---- test-side API ------------------------------------------------------------------
@@ -639,6 +665,7 @@ void Reset() {
             n.pollTimeouts.clear();
             n.readSizes.clear();
             n.pollCalls = n.readCalls = 0;
+            n.expiredPolls = 0;
             n.openFds.clear();
             n.lastFlags = 0;
             n.forcedFlags.reset();
@@ -724,6 +751,13 @@ void QueueNotification(const char *path, const mfp_notif_t &notif) {
         uint64_t v;
         std::memcpy(&v, &notif, sizeof v);
         if (!gSignal[i].notifs.push(v)) throw std::length_error("vdev: notification queue full");
+        if (notif.ub_notif == MFP_DEV_DISCONNECT) {
+            // A cable pull loses what the host had in flight, on every
+            // interface of the bridge.
+            for (int j = 0; j < kNodeCount; ++j) {
+                if (kNodes[j].notifications) DropTransfers(M().nodes[j]);
+            }
+        }
         NodeState &n = M().nodes[i];
         for (int fd : n.openFds) {
             const FdState &st = M().fds.at(fd);
@@ -794,6 +828,12 @@ size_t PollCalls(const char *path) {
     int i = NodeIndex(path);
     std::lock_guard lk(M().mu);
     return M().nodes[i].pollCalls;
+}
+
+size_t ExpiredPolls(const char *path) {
+    int i = NodeIndex(path);
+    std::lock_guard lk(M().mu);
+    return M().nodes[i].expiredPolls;
 }
 
 size_t ReadCalls(const char *path) {

@@ -20,6 +20,8 @@
 //   an ExpireRead or instant time-outs; then it returns 0. With O_NONBLOCK it
 //   fails with EAGAIN at once. A signal interrupts it with EINTR, as it does a
 //   driver read (and poll).
+// - Queuing MFP_DEV_DISCONNECT (a cable pull) discards the host transfers not
+//   yet read, on every bridge node, as the real bridge loses what was in flight.
 // - MFP_IOC_GET_NOTIF on an empty queue fails with EAGAIN. It never blocks,
 //   locks or allocates, so a SIGIO handler may call it whatever the interrupted
 //   thread was doing (inside vdev included).
@@ -113,6 +115,8 @@ std::vector<size_t> ReadSizes(const char *path);
 // above (a waiter can compare them safely).
 size_t PollCalls(const char *path);
 size_t ReadCalls(const char *path);
+// Polls on the node that ended in a time-out (real or virtual) since Reset().
+size_t ExpiredPolls(const char *path);
 
 mfp_to_t Timeouts();                     // last IOCNR_SET_MFP_TO (initial values otherwise)
 void SetTimeouts(const mfp_to_t &to);    // what IOCNR_GET_MFP_TO answers

@@ -1,5 +1,6 @@
 // SIGIO raised for a notification only to an owner that switched on O_ASYNC
 // (never for arriving data), and a handler that may interrupt vdev itself.
+#include <poll.h>
 #include <pthread.h>
 #include <signal.h>
 
@@ -128,4 +129,31 @@ TEST_F(Notifications, HandlerInterruptingAThreadInsideVdevDoesNotDeadlock) {
         if (c.request == MFP_IOC_GET_NOTIF && c.result == 0) ++fromHandler;
     }
     EXPECT_EQ(fromHandler, static_cast<size_t>(kRounds)) << "calls made in the handler are recorded";
+}
+
+// A cable pull loses what the host had in flight on both interfaces; other
+// notifications leave the transfers alone.
+TEST_F(Notifications, DisconnectDiscardsUnreadHostTransfersOnEveryBridgeNode) {
+    UniqueFd prn = Open(vdev::kPrn);
+    UniqueFd scan = Open(vdev::kScan);
+    char buf[16];
+    for (uint8_t code : {uint8_t{MFP_DEV_CONFIGURED}, uint8_t{MFP_DEV_RESET}, uint8_t{MFP_DEV_DISCONNECT}}) {
+        SCOPED_TRACE(int{code});
+        vdev::HostWrite(vdev::kPrn, "MAASTART");
+        vdev::HostWrite(vdev::kPrn, "more");
+        vdev::HostWrite(vdev::kScan, "scan");
+        ASSERT_EQ(::read(prn.get(), buf, 3), 3);  // part of the first transfer taken
+        vdev::QueueNotification(vdev::kPrn, Notif(code, eMfp_Notif_Both));
+        const bool pulled = code == MFP_DEV_DISCONNECT;
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), pulled ? 0u : 9u);
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kScan), pulled ? 0u : 4u);
+        pollfd p{prn.get(), POLLIN, 0};
+        EXPECT_EQ(::poll(&p, 1, 0), pulled ? 0 : 1) << "readiness follows the transfers";
+        // What the host sends after the pull arrives as usual.
+        vdev::Reset();
+        prn = Open(vdev::kPrn);
+        scan = Open(vdev::kScan);
+        vdev::HostWrite(vdev::kPrn, "next");
+        EXPECT_EQ(::read(prn.get(), buf, sizeof buf), 4);
+    }
 }
