@@ -1,7 +1,6 @@
 #include "maa/MAA_Hook.h"
 
 #include <fcntl.h>
-#include <poll.h>
 #include <pthread.h>
 #include <sys/msg.h>
 #include <unistd.h>
@@ -23,20 +22,12 @@
 #include "maa/MAA_Result.h"
 #include "vendor/VLX_Main.h"
 
-const U8 HeaderCmd[HDR_CMD_LEN] = {0x1B, 0x77, 'M', 'A', 'A', 'S', 'T', 'A', 'R', 'T'};
-const U8 HeaderResCmd[HDR_RESP_CMD_LEN] = {0x1B, 0x77, 'M', 'A', 'A', '-', 'O', 'K'};
-const U8 TailCmd[TAIL_CMD_LEN] = {'M', 'A', 'A', '-', 'S', 'T', 'O', 'P'};
-const U8 SpecialCmdPrefix[SPCL_CMD_LEN] = {'#', '$', '%'};
-
 U8 aubBuf[MAA_LINE_BUFFER_SIZE];
 U32 dataReadCount = 0;
 U32 fSellStop = 0;
 U32 ulReadCount = 0;
 MAAHeapHandle stDataHeap = {};
 MAAHeapHandle stCmdHeap = {};
-namespace maa_session {
-S32 slPollTimeout = MAA_POLL_TIMEOUT_FIRST;
-}
 
 namespace {
 
@@ -44,11 +35,8 @@ constexpr key_t kMAAQueueKey = 1234;
 constexpr char kUsbSpeedFile[] = "/halvard/sys/statusinfo/usb_speed.txt";
 constexpr U32 kRawBytesAfterHash = 8;
 
-U8 ubDMChar;
-// Most recent download buffer, its size and its address in the shell's map.
+// Most recent download buffer (owned by the session's download store).
 U8 *addr = nullptr;
-U32 ulAddrSize = 0;
-U32 ulAddrMapped = 0;
 pthread_t thrThread;
 sched_param thrParam;
 
@@ -111,65 +99,6 @@ void *readerThread(void *) {
 }
 
 }  // namespace
-
-// ---- driver access ----------------------------------------------------------
-
-U32 DM_ReadDriver(U32 ulHandle, U8 **pubbufPtr, U32 /*ulReadSize*/, U32 *pulReturnSize, TDMCallback) {
-    *pulReturnSize = 0;
-    if (MAA_IsUSBDisconnected()) {
-        USBADP_LOG(ERROR, "\r\n[MAA] ReadDriver: USB Disconnected");
-        return DM_RET_USB_DISCONNECTED;
-    }
-    pollfd pfd{static_cast<int>(ulHandle), POLLIN, 0};
-    int r = ::poll(&pfd, 1, maa_session::slPollTimeout);
-    if (r == 0 && maa_session::slPollTimeout == MAA_POLL_TIMEOUT_FIRST) maa_session::slPollTimeout = MAA_POLL_TIMEOUT;
-    ssize_t count = 0;
-    if (r < 1) {
-        USBADP_LOG(DEBUG, "\r\n[MAA] No Data to read\n");
-    } else {
-        count = ::read(static_cast<int>(ulHandle), &ubDMChar, 1);
-    }
-    if (count < 1) {
-        USBADP_LOG(DEBUG, "\r\n Serial Read Error\\No data");
-        return DM_RET_TIMEOUT;
-    }
-    *pubbufPtr = &ubDMChar;
-    *pulReturnSize = 1;
-    return DM_RET_OK;
-}
-
-U32 DM_WriteDriver(U32 ulHandle, const U8 *pubBufPtr, U32 ulWriteSize, U32 *pulReturnSize, TDMCallback) {
-    USBADP_LOG(DEBUG, "[MAA] WriteDriver START (%d bytes)\n", static_cast<int>(ulWriteSize));
-    U32 total = 0;
-    for (;;) {
-        if (MAA_IsUSBDisconnected()) {
-            USBADP_LOG(ERROR, "[MAA] WriteDriver: USB Disconnected (%d/%d)\n", static_cast<int>(total),
-                       static_cast<int>(ulWriteSize));
-            *pulReturnSize = ulWriteSize;
-            return DM_RET_USB_DISCONNECTED;
-        }
-        // A retry starts again at the buffer's beginning, as the driver layer
-        // always has; the bridge writes whole buffers.
-        ssize_t w = ::write(static_cast<int>(ulHandle), pubBufPtr, ulWriteSize);
-        if (w < 1) {
-            int err = errno;
-            USBADP_LOG(ERROR, "[MAA] WriteDriver: write (ret=%d,errno=%d,%s)(%d/%d)\n", static_cast<int>(w), err,
-                       std::strerror(err), static_cast<int>(total), static_cast<int>(ulWriteSize));
-            break;
-        }
-        total += static_cast<U32>(w);
-        if (total == ulWriteSize) break;
-        if (total > ulWriteSize) {
-            USBADP_LOG(ERROR, "[MAA] WriteDriver: write overflow (%d/%d)\n", static_cast<int>(total),
-                       static_cast<int>(ulWriteSize));
-            break;
-        }
-    }
-    // Only a disconnect is reported: callers cannot act on a failed write.
-    *pulReturnSize = ulWriteSize;
-    USBADP_LOG(DEBUG, "[MAA] WriteDriver DONE (%d bytes)\n", static_cast<int>(ulWriteSize));
-    return DM_RET_OK;
-}
 
 // ---- start and stop ------------------------------------------------------------
 
@@ -326,27 +255,10 @@ S32 MAA_CheckSpecialCommand(const U8 *ubBuf) {
 }
 
 U32 Request_MAA_CommandH2T(U32 size) {
-    if (addr != nullptr) {
-        // Only the newest download is reachable; an older address is refused.
-        if (ulAddrMapped != 0 && MAA_AddrOf(addr) == ulAddrMapped) MAA_AddrUnmap(ulAddrMapped);
-        std::free(addr);
-    }
-    addr = size <= MAA_HEAP_REQUEST_MAX ? static_cast<U8 *>(std::malloc(size ? size : 1)) : nullptr;
-    ulAddrSize = 0;
-    ulAddrMapped = 0;
-    if (addr == nullptr) {
-        USBADP_LOG(ERROR, "\r\n[MAA] Data Allocation in Heap Failed");
-        return 0;
-    }
-    std::memset(addr, 0, size);
-    ulAddrSize = size;
-    if (size != 0) ulAddrMapped = MAA_AddrMap(addr, size);
-    return ulAddrMapped;
-}
-
-U8 *MAA_DownloadBuffer(U32 *pulSize) {
-    *pulSize = ulAddrSize;
-    return addr;
+    U32 address = 0;
+    addr = MAA_DownloadAlloc(size, &address);
+    if (addr == nullptr) USBADP_LOG(ERROR, "\r\n[MAA] Data Allocation in Heap Failed");
+    return address;
 }
 
 void MAA_CommandH2T(U32 ulFileSize) {
@@ -433,6 +345,11 @@ S32 MAA_Hook(U32 ulDrvHandleGot, U8 *command) {
         return 0;
     }
 
+    // Downloads are the session's: every address the host got stays valid
+    // until the session ends (stop, cable, or the auto run after the stop).
+    struct SessionEnd {
+        ~SessionEnd() { MAA_DownloadFreeAll(); }
+    } sessionEnd;
     fSellStop = 0;
     for (;;) {
         MAA_ReadLine(session(), aubBuf);

@@ -3,8 +3,10 @@
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
+#include <vector>
 
 #include "common/Log.h"
+#include "maa/MAA_Address.h"
 
 alignas(8) U8 abDmMemPool[MAA_MEM_POOL_SIZE];
 TMemPoolInfo stPoolTable;
@@ -56,4 +58,53 @@ void MAA_InitMem() {
     stPoolTable.pstFree_Bufs = desc;
     stPoolTable.ulBuffer_Size = 0;
     stPoolTable.ubNext_Free_Pool = 0;
+}
+
+namespace {
+
+struct Download {
+    U8 *data;
+    U32 size;
+    U32 address;
+};
+std::vector<Download> downloads;
+U8 *currentDownload = nullptr;
+U32 currentSize = 0;
+U32 downloadTotal = 0;
+
+}  // namespace
+
+U8 *MAA_DownloadAlloc(U32 ulSize, U32 *pulAddress) {
+    *pulAddress = 0;
+    currentDownload = nullptr;
+    currentSize = 0;
+    if (ulSize > MAA_DOWNLOAD_TOTAL_MAX - downloadTotal) return nullptr;
+    U8 *p = static_cast<U8 *>(std::calloc(ulSize ? ulSize : 1, 1));
+    if (p == nullptr) return nullptr;
+    const U32 address = ulSize != 0 ? MAA_AddrMap(p, ulSize) : 0;
+    downloads.push_back({p, ulSize, address});
+    downloadTotal += ulSize;
+    currentDownload = p;
+    currentSize = ulSize;
+    *pulAddress = address;
+    return p;
+}
+
+U8 *MAA_DownloadBuffer(U32 *pulSize) {
+    *pulSize = currentSize;
+    return currentDownload;
+}
+
+U32 MAA_DownloadTotal(void) { return downloadTotal; }
+
+void MAA_DownloadFreeAll(void) {
+    for (const Download &d : downloads) {
+        // Only while the address is still this buffer's (a reset map may reuse it).
+        if (d.address != 0 && MAA_AddrTranslate(d.address, 1) == d.data) MAA_AddrUnmap(d.address);
+        std::free(d.data);
+    }
+    downloads.clear();
+    downloadTotal = 0;
+    currentDownload = nullptr;
+    currentSize = 0;
 }

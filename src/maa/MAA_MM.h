@@ -51,3 +51,20 @@ void MAA_SegFree(void *pvPtr, U32 ulPool);
 void MAA_SegmentInitialize();
 // Lays out the tagged pool: a guard tag, one free block, a guard tag.
 void MAA_InitMem();
+
+// ---- host-to-device downloads of the current session
+// Every download stays addressable until the session ends, since factory
+// scripts download several files before passing each address to a function.
+constexpr U32 MAA_DOWNLOAD_TOTAL_MAX = 256u << 20;  // per session
+
+// A zeroed buffer of ulSize bytes for the download that follows, and its
+// address in the shell's map (0 for an empty buffer). Null, and no current
+// download, when the session's total would pass MAA_DOWNLOAD_TOTAL_MAX or
+// memory is short.
+U8 *MAA_DownloadAlloc(U32 ulSize, U32 *pulAddress);
+// The current download (the newest, null when its allocation failed) and its size.
+U8 *MAA_DownloadBuffer(U32 *pulSize);
+// Bytes the session's downloads hold.
+U32 MAA_DownloadTotal(void);
+// The session is over: every download is unmapped and freed.
+void MAA_DownloadFreeAll(void);

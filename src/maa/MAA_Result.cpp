@@ -15,8 +15,10 @@
 #include "common/Log.h"
 #include "common/UniqueFd.h"
 #include "maa/MAA_Address.h"
-#include "maa/MAA_Hook.h"
+#include "maa/MAA_Driver.h"
 #include "maa/MAA_IF.h"
+#include "maa/MAA_MM.h"
+#include "maa/MAA_Wire.h"
 #include "vendor/VLX_Main.h"
 
 TMAAResult stMAASysResult;

@@ -84,27 +84,80 @@ TEST_F(SessionTest, LineEndsAtCrLfOrTheLimitAndTakesEightRawBytesBehindAHash) {
     }
 }
 
+// A test function that consumes a download: the bytes at an address, as its
+// result text ("unreachable" when the address is not a live buffer).
+std::string peekText;
+TMAAResult stPeek;
+TMAAResult *peek(U32 address, U32 size) {
+    const void *p = MAA_AddrTranslate(address, size);
+    peekText = p ? std::string(static_cast<const char *>(p), size) : "unreachable";
+    stPeek = {MAA_RESULT_END, 1, static_cast<U32>(peekText.size()), reinterpret_cast<U8 *>(peekText.data())};
+    return &stPeek;
+}
+
+std::string PeekLine(U32 address, U32 size) {
+    return "peek(" + std::to_string(address) + ", " + std::to_string(size) + ")\r";
+}
+
 TEST_F(SessionTest, DownloadSendsItsAddressAndTakesExactlyTheAnnouncedBytes) {
     const std::string raw = S("\nMAA-STOP\r\0#$%(\n");
     ASSERT_EQ(raw.size(), 16u);
-    Outcome o = Session({"MAASTART", Special(MAA_FILE_TRANS_H2T, 16) + raw.substr(0, 5), raw.substr(5) + "probe(4)\r",
-                         "MAA-STOP\r"});
+    MAA_SymbolAdd(ftarget_ppc, "peek", MAA_SYM_FUNC, MAA_FuncEntry<peek>(), 2);
+    U32 address = 0;
+    std::string early;  // what the host had received when it sent the peeks
+    Outcome o = Session({"MAASTART", Special(MAA_FILE_TRANS_H2T, 16) + raw.substr(0, 5), raw.substr(5) + "probe(4)\r"},
+                        0, [&] {
+                            early = Str(vdev::HostReadAtLeast(vdev::kPrn, 12, 5000));
+                            if (early.size() >= 12) address = ReadBE32(reinterpret_cast<const U8 *>(early.data() + 8));
+                            vdev::HostWrite(vdev::kPrn, PeekLine(address, 16) + PeekLine(address, 17) + "MAA-STOP\r");
+                        });
     EXPECT_EQ(o.ret, 0);
-    ASSERT_EQ(o.wire.size(), kAck.size() + 4 + Frame(1, 4, "probe 4").size() + kAck.size());
-    EXPECT_EQ(o.wire.substr(0, 8), kAck);
-    EXPECT_EQ(o.wire.substr(12), Frame(1, 4, "probe 4") + kAck) << "the line behind the file is whole";
-
-    const U32 address = ReadBE32(reinterpret_cast<const U8 *>(o.wire.data() + 8));
+    ASSERT_GE(early.size(), 12u);
+    EXPECT_EQ(early.substr(0, 8), kAck);
     EXPECT_GE(address, MAA_ADDR_BASE);
-    const U8 *buffer = static_cast<const U8 *>(MAA_AddrTranslate(address, 16));
-    ASSERT_NE(buffer, nullptr);
-    EXPECT_EQ(std::string(reinterpret_cast<const char *>(buffer), 16), raw);
-    EXPECT_EQ(MAA_AddrTranslate(address, 17), nullptr) << "the buffer is exactly the announced size";
+    EXPECT_EQ(early.substr(12) + o.wire, Frame(1, 4, "probe 4") + Frame(1, 1, raw) + Frame(1, 1, "unreachable") + kAck)
+        << "the line behind the file is whole; the buffer is exactly the announced size";
+}
 
-    // A second download replaces the first: its address is no longer reachable.
-    o = Session({"MAASTART", Special(MAA_FILE_TRANS_H2T, 2) + "ok", "MAA-STOP\r"});
-    EXPECT_NE(ReadBE32(reinterpret_cast<const U8 *>(o.wire.data() + 8)), address);
-    EXPECT_EQ(MAA_AddrTranslate(address, 1), nullptr);
+// Factory scripts download several files, then pass each address on: every
+// download of a session stays addressable until the session ends.
+TEST_F(SessionTest, EveryDownloadOfASessionStaysAddressableUntilItEnds) {
+    MAA_SymbolAdd(ftarget_ppc, "peek", MAA_SYM_FUNC, MAA_FuncEntry<peek>(), 2);
+    const std::vector<std::string> files = {"first file", std::string(5000, 'b'), "third"};
+    std::vector<U32> addresses;
+    Outcome o = Session({"MAASTART"}, 0, [&] {
+        EXPECT_EQ(Str(vdev::HostReadAtLeast(vdev::kPrn, 8, 5000)), kAck);
+        for (const std::string &f : files) {
+            vdev::HostWrite(vdev::kPrn, Special(MAA_FILE_TRANS_H2T, static_cast<U32>(f.size())) + f);
+            std::string got = Str(vdev::HostReadAtLeast(vdev::kPrn, 4, 5000));
+            ASSERT_EQ(got.size(), 4u);
+            addresses.push_back(ReadBE32(reinterpret_cast<const U8 *>(got.data())));
+        }
+        std::string lines;
+        for (size_t i = files.size(); i-- > 0;) lines += PeekLine(addresses[i], static_cast<U32>(files[i].size()));
+        vdev::HostWrite(vdev::kPrn, lines + "MAA-STOP\r");
+    });
+    EXPECT_EQ(o.ret, 0);
+    EXPECT_EQ(o.wire, Frame(1, 1, files[2]) + Frame(1, 1, files[1]) + Frame(1, 1, files[0]) + kAck);
+    EXPECT_EQ(MAA_DownloadTotal(), 0u) << "the session's downloads are freed when it ends";
+    for (U32 a : addresses) EXPECT_EQ(MAA_AddrTranslate(a, 1), nullptr);
+}
+
+// A departure: a session holds at most 256 MiB of downloads; past that the
+// allocation fails as memory would. Sizes only: nothing is written to them.
+TEST(Downloads, SessionTotalIsCappedAndFreedWithTheSession) {
+    MAA_DownloadFreeAll();
+    U32 address = 0;
+    for (int i = 0; i < 4; ++i) ASSERT_NE(MAA_DownloadAlloc(64u << 20, &address), nullptr) << i;
+    EXPECT_EQ(MAA_DownloadTotal(), MAA_DOWNLOAD_TOTAL_MAX);
+    EXPECT_EQ(MAA_DownloadAlloc(1, &address), nullptr);
+    EXPECT_EQ(address, 0u);
+    U32 size = 1;
+    EXPECT_EQ(MAA_DownloadBuffer(&size), nullptr) << "a failed download is not the previous one";
+    EXPECT_EQ(size, 0u);
+    MAA_DownloadFreeAll();
+    EXPECT_NE(MAA_DownloadAlloc(1, &address), nullptr);
+    MAA_DownloadFreeAll();
 }
 
 TEST_F(SessionTest, SizeBytesThatUnbalanceTheLineMakeAnInvalidCommand) {
@@ -148,15 +201,26 @@ TEST_F(SessionTest, PulledCableEndsTheSessionAndDropsTheCutLine) {
     EXPECT_EQ(LoggerHost_Count("\r\n[MAA:MAA_Hook] Cable Disconnected during MAA_ReadLine"), 1);
 }
 
-TEST_F(SessionTest, DriverLayerReadsOneByteAndHidesWriteErrorsButNotADisconnect) {
+// A departure: the driver layer reads up to min(requested, 4096) bytes at a
+// time; the line readers ask for one byte, so only downloads read ahead.
+TEST_F(SessionTest, DriverLayerReadsWhatIsAskedUpToAPieceAndHidesWriteErrorsButNotADisconnect) {
     vdev::HostWrite(vdev::kPrn, "xyz");
+    vdev::HostWrite(vdev::kPrn, std::string(5000, 'q'));
+    struct Row {
+        U32 ask;
+        std::string got;
+    } rows[] = {{1, "x"}, {3, "yz"}, {100000, std::string(4096, 'q')}, {0, "q"}, {9999, std::string(903, 'q')}};
+    for (const Row &r : rows) {
+        U8 *p = nullptr;
+        U32 n = 0;
+        ASSERT_EQ(DM_ReadDriver(static_cast<U32>(fd), &p, r.ask, &n, nullptr), DM_RET_OK) << r.ask;
+        EXPECT_EQ(std::string(reinterpret_cast<char *>(p), n), r.got) << r.ask;
+    }
+    EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 0u);
+    vdev::HostWrite(vdev::kPrn, "xy");
+
     U8 *p = nullptr;
     U32 n = 0;
-    EXPECT_EQ(DM_ReadDriver(static_cast<U32>(fd), &p, 3, &n, nullptr), DM_RET_OK);
-    EXPECT_EQ(n, 1u);
-    EXPECT_EQ(*p, 'x');
-    EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 2u);
-
     EXPECT_EQ(DM_WriteDriver(0xFFFFFFFF, HeaderResCmd, 8, &n, nullptr), DM_RET_OK);
     EXPECT_EQ(n, 8u);
     EXPECT_TRUE(LoggerHost_Contains("[MAA] WriteDriver: write (ret=-1,errno=9,"));

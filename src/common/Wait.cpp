@@ -1,0 +1,57 @@
+#include "common/Wait.h"
+
+#include <poll.h>
+#include <time.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+
+namespace {
+
+// Longest single sleep of Wait_Idle: gone() is looked at this often, since the
+// signal that changes it may land on another thread.
+constexpr int kIdleSliceMs = 50;
+
+int remaining(int64_t deadline) {
+    if (deadline < 0) return -1;
+    return static_cast<int>(std::max<int64_t>(0, deadline - Wait_NowMs()));
+}
+
+}  // namespace
+
+int64_t Wait_NowMs() {
+    timespec ts;
+    clock_gettime(CLOCK_MONOTONIC, &ts);
+    return static_cast<int64_t>(ts.tv_sec) * 1000 + ts.tv_nsec / 1000000;
+}
+
+int Wait_PollIn(int fd, int timeoutMs, short *revents, WaitGoneFn gone) {
+    const int64_t deadline = timeoutMs < 0 ? -1 : Wait_NowMs() + timeoutMs;
+    int wait = timeoutMs;
+    for (;;) {
+        pollfd pfd{fd, POLLIN, 0};
+        int r = ::poll(&pfd, 1, wait);
+        if (revents) *revents = pfd.revents;
+        if (r >= 0 || errno != EINTR) return r;
+        if (gone && gone()) return -1;
+        wait = remaining(deadline);
+    }
+}
+
+ssize_t Wait_Read(int fd, void *buf, size_t size, WaitGoneFn gone) {
+    for (;;) {
+        ssize_t n = ::read(fd, buf, size);
+        if (n >= 0 || errno != EINTR) return n;
+        if (gone && gone()) return -1;
+    }
+}
+
+void Wait_Idle(int ms, WaitGoneFn gone) {
+    const int64_t deadline = Wait_NowMs() + std::max(ms, 0);
+    for (int left = remaining(deadline); left > 0; left = remaining(deadline)) {
+        if (gone && gone()) return;
+        timespec ts{0, static_cast<long>(std::min(left, kIdleSliceMs)) * 1000000L};
+        ::nanosleep(&ts, nullptr);
+    }
+}

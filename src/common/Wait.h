@@ -1,0 +1,32 @@
+// Waits on a device node that survive signals. The bridge's notifications come
+// as SIGIO, installed without SA_RESTART, on whatever thread the kernel picks:
+// an interrupted wait is neither a time-out nor an error nor an empty read. It
+// goes on towards the deadline it started with, so a stream of signals never
+// postpones a time-out.
+#pragma once
+
+#include <sys/types.h>
+
+#include <cstddef>
+#include <cstdint>
+
+// Asked after each interruption (and while idling): true ends the wait at once,
+// because what it waits for can no longer come (the cable is gone, the channel
+// is being closed). Null: never.
+using WaitGoneFn = bool (*)();
+
+// Milliseconds on the monotonic clock.
+int64_t Wait_NowMs();
+
+// poll(2) for input on one descriptor within timeoutMs (< 0: no limit).
+// > 0 ready (revents set), 0 time-out, -1 error with errno; -1 with EINTR only
+// when gone() asked to stop.
+int Wait_PollIn(int fd, int timeoutMs, short *revents, WaitGoneFn gone = nullptr);
+
+// read(2) that resumes after a signal; -1 with EINTR only when gone() asked to
+// stop.
+ssize_t Wait_Read(int fd, void *buf, size_t size, WaitGoneFn gone = nullptr);
+
+// Lets `ms` pass without spinning (a channel that reports readiness but gives
+// nothing must not be polled in a tight loop); returns early when gone().
+void Wait_Idle(int ms, WaitGoneFn gone = nullptr);

@@ -1,0 +1,95 @@
+#include "maa/MAA_Driver.h"
+
+#include <poll.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+
+#include "adapter/USB.h"
+#include "common/Log.h"
+#include "common/Wait.h"
+
+namespace maa_session {
+S32 slPollTimeout = MAA_POLL_TIMEOUT_FIRST;
+}
+
+namespace {
+
+U8 aubDMBuf[DM_READ_PIECE_MAX];
+
+bool cableGone() { return MAA_IsUSBDisconnected() != 0; }
+
+}  // namespace
+
+U32 DM_ReadDriver(U32 ulHandle, U8 **pubbufPtr, U32 ulReadSize, U32 *pulReturnSize, TDMCallback) {
+    *pulReturnSize = 0;
+    if (MAA_IsUSBDisconnected()) {
+        USBADP_LOG(ERROR, "\r\n[MAA] ReadDriver: USB Disconnected");
+        return DM_RET_USB_DISCONNECTED;
+    }
+    const int fd = static_cast<int>(ulHandle);
+    const S32 period = maa_session::slPollTimeout;
+    const int64_t start = Wait_NowMs();
+    short revents = 0;
+    int r = Wait_PollIn(fd, period, &revents, cableGone);
+    if (r == 0 && period == MAA_POLL_TIMEOUT_FIRST) maa_session::slPollTimeout = MAA_POLL_TIMEOUT;
+    ssize_t count = 0;
+    if (r < 1) {
+        USBADP_LOG(DEBUG, "\r\n[MAA] No Data to read\n");
+    } else {
+        const size_t want = std::clamp<U32>(ulReadSize, 1, DM_READ_PIECE_MAX);
+        count = Wait_Read(fd, aubDMBuf, want, cableGone);
+    }
+    if (count < 1) {
+        USBADP_LOG(DEBUG, "\r\n Serial Read Error\\No data");
+        // Ready and yet nothing (hung up, closed, an error, an empty read): the
+        // period is over only when its time is, or the line readers that retry
+        // on a time-out would spin.
+        if (r > 0 || (r < 0 && errno != EINTR))
+            Wait_Idle(static_cast<int>(period - (Wait_NowMs() - start)), cableGone);
+        if (MAA_IsUSBDisconnected()) {
+            USBADP_LOG(ERROR, "\r\n[MAA] ReadDriver: USB Disconnected");
+            return DM_RET_USB_DISCONNECTED;
+        }
+        return DM_RET_TIMEOUT;
+    }
+    *pubbufPtr = aubDMBuf;
+    *pulReturnSize = static_cast<U32>(count);
+    return DM_RET_OK;
+}
+
+U32 DM_WriteDriver(U32 ulHandle, const U8 *pubBufPtr, U32 ulWriteSize, U32 *pulReturnSize, TDMCallback) {
+    USBADP_LOG(DEBUG, "[MAA] WriteDriver START (%d bytes)\n", static_cast<int>(ulWriteSize));
+    U32 total = 0;
+    for (;;) {
+        if (MAA_IsUSBDisconnected()) {
+            USBADP_LOG(ERROR, "[MAA] WriteDriver: USB Disconnected (%d/%d)\n", static_cast<int>(total),
+                       static_cast<int>(ulWriteSize));
+            *pulReturnSize = ulWriteSize;
+            return DM_RET_USB_DISCONNECTED;
+        }
+        // A retry starts again at the buffer's beginning, as the driver layer
+        // always has; the bridge writes whole buffers.
+        ssize_t w = ::write(static_cast<int>(ulHandle), pubBufPtr, ulWriteSize);
+        if (w < 0 && errno == EINTR) continue;  // nothing was written yet
+        if (w < 1) {
+            int err = errno;
+            USBADP_LOG(ERROR, "[MAA] WriteDriver: write (ret=%d,errno=%d,%s)(%d/%d)\n", static_cast<int>(w), err,
+                       std::strerror(err), static_cast<int>(total), static_cast<int>(ulWriteSize));
+            break;
+        }
+        total += static_cast<U32>(w);
+        if (total == ulWriteSize) break;
+        if (total > ulWriteSize) {
+            USBADP_LOG(ERROR, "[MAA] WriteDriver: write overflow (%d/%d)\n", static_cast<int>(total),
+                       static_cast<int>(ulWriteSize));
+            break;
+        }
+    }
+    // Only a disconnect is reported: callers cannot act on a failed write.
+    *pulReturnSize = ulWriteSize;
+    USBADP_LOG(DEBUG, "[MAA] WriteDriver DONE (%d bytes)\n", static_cast<int>(ulWriteSize));
+    return DM_RET_OK;
+}
