@@ -12,6 +12,7 @@
 #include "adapter/prn_thread.h"
 #include "common/ByteOrder.h"
 #include "common/Log.h"
+#include "common/Wait.h"
 #include "firmware/FirmWareUpdate.h"
 #include "maa/MAA_Hook.h"
 #include "print/USBPrint.h"
@@ -54,27 +55,34 @@ const AppKind kFAXD{"FAXD", "faxd", "USBADP_CheckFAXDApp", 0x0E, true, true, 0,
 // without this a silent host would hold the reader for ever.
 bool channelGone() { return IsDisconnected.load() || hibernation_flag.load(); }
 
-// Reads the whole body. False on a read error or when the channel goes away.
-bool readBody(const AppKind &k, U8 *body, S32 len) {
+enum class BodyRead { Whole, Failed, Cut };
+
+// Reads the whole body; Cut when the cable is pulled or the channel closed
+// before it was all there.
+BodyRead readBody(const AppKind &k, U8 *body, S32 len) {
     S32 got = 0;
     while (got < len) {
-        ssize_t n = ::read(fdPrn.load(), body + got, static_cast<size_t>(len - got));
+        ssize_t n = Wait_Read(fdPrn.load(), body + got, static_cast<size_t>(len - got), channelGone);
         int err = n < 0 ? errno : 0;
         char line[96];
         std::snprintf(line, sizeof line, "[USBAdp] [%s] read bytes from %s App, slRet: %%d\n", k.tag, k.tag);
         USBADP_LOG(DEBUG, line, static_cast<int>(n));
-        if (n < 0 && err == EINTR) continue;
-        if (n < 0 || (n == 0 && channelGone())) {
+        if ((n < 0 && err == EINTR) || (n == 0 && channelGone())) {
+            std::snprintf(line, sizeof line, "[USBAdp] [%s] Body cut after %%d of %%d bytes, packet dropped\n", k.tag);
+            USBADP_LOG(ERROR, line, got, len);
+            return BodyRead::Cut;
+        }
+        if (n < 0) {
             std::snprintf(line, sizeof line,
                           "[USBAdp] [%s] Error in reading from fdPrn, sl%sXMLPacketLen: %%d, errno: %%d\n", k.tag,
                           k.tag);
             USBADP_LOG(ERROR, line, len, err);
-            return false;
+            return BodyRead::Failed;
         }
         // A read of 0 is the driver's time-out: the host may still send.
         got += static_cast<S32>(n);
     }
-    return true;
+    return BodyRead::Whole;
 }
 
 void logWithTag(const AppKind &k, const char *format) {
@@ -123,7 +131,13 @@ S32 checkApp(const AppKind &k, U8 *hdr) {
                 USBADP_LOG(ERROR, line, len, errno);
                 return k.unreadableAnswer;
             }
-            if (!readBody(k, body.get(), len)) return k.unreadableAnswer;
+            switch (readBody(k, body.get(), len)) {
+            case BodyRead::Whole: break;
+            case BodyRead::Failed: return k.unreadableAnswer;
+            // What the host had sent of it is gone with the cable: its header
+            // alone must not become a print job.
+            case BodyRead::Cut: return -2;
+            }
         }
     }
 
@@ -173,7 +187,7 @@ S32 classifyIds(U8 *pubCommand, U8 *pubfirmware_command, S32 *slfirmRes) {
     aubBuf[0] = pubCommand[0];
     aubBuf[1] = pubCommand[1];
     // One read; a short header is not completed.
-    if (::read(fdPrn.load(), aubBuf + 2, VLX_HEADER - 2) < 0) {
+    if (Wait_Read(fdPrn.load(), aubBuf + 2, VLX_HEADER - 2, channelGone) < 0) {
         USBADP_LOG(ERROR, "[USBAdp] Error in reading IDS header, errno: %d\n", errno);
         return -2;
     }

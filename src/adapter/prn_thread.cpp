@@ -17,6 +17,7 @@
 #include "adapter/SerialNumber.h"
 #include "adapter/USB.h"
 #include "common/Log.h"
+#include "common/Wait.h"
 #include "maa/MAA_Hook.h"
 #include "platform/Platform.h"
 #include "print/USBPrint.h"
@@ -52,15 +53,13 @@ U8 aubsplitUelSendBuffer[COMMAND_SIZE];
 bool shouldPark() { return !IsConfigured.load() || hibernation_flag.load() != 0; }
 
 // poll for input on the print node. A signal (the bridge's notifications come
-// as SIGIO) is not a reason to stop waiting unless it asked the reader to park.
-int pollPrn(int timeoutMs, short *revents) {
-    for (;;) {
-        pollfd pfd{fdPrn.load(), POLLIN, 0};
-        int r = ::poll(&pfd, 1, timeoutMs);
-        if (r < 0 && errno == EINTR && !shouldPark()) continue;
-        *revents = pfd.revents;
-        return r;
-    }
+// as SIGIO) does not end the wait unless the reader is to park.
+int pollPrn(int timeoutMs, short *revents) { return Wait_PollIn(fdPrn.load(), timeoutMs, revents, shouldPark); }
+
+// The node said it was ready and gave nothing (hung up, closed, failed): the
+// poll period is over only when its time is, or the reader would spin.
+void idleRestOfPeriod(int64_t start, int periodMs) {
+    Wait_Idle(static_cast<int>(periodMs - (Wait_NowMs() - start)), shouldPark);
 }
 
 // Opens a job if none is open. False when Java refused it; the chunk that
@@ -282,10 +281,15 @@ void InitializeVars(void) {
 }
 
 S32 USBAdapter_ReadDataClassifier(U8 *buf) {
+    const int64_t start = Wait_NowMs();
+    const S32 period = slPollTimeout;
     short revents = 0;
-    int r = pollPrn(slPollTimeout, &revents);
+    int r = pollPrn(period, &revents);
     if (r < 0) {
+        // Interrupted only to park: not an error, and not a silence either.
+        if (errno == EINTR) return -1;
         USBADP_LOG(ERROR, "[USBAdp] Error in poll in ReadDataClassifier, errno: %d\n", errno);
+        idleRestOfPeriod(start, period);
         return -1;
     }
     if (r == 0) {
@@ -295,19 +299,24 @@ S32 USBAdapter_ReadDataClassifier(U8 *buf) {
         }
         return -1;
     }
-    ssize_t n = ::read(fdPrn.load(), buf, 2);
+    ssize_t n = Wait_Read(fdPrn.load(), buf, 2, shouldPark);
     int err = errno;
     if (n == 1) {
         // The host's transfer held one byte: the selector is in the next one.
-        if (pollPrn(slPollTimeout, &revents) > 0 && ::read(fdPrn.load(), buf + 1, 1) == 1) n = 2;
+        if (pollPrn(slPollTimeout, &revents) > 0 && Wait_Read(fdPrn.load(), buf + 1, 1, shouldPark) == 1) n = 2;
     }
     USBADP_LOG(DEBUG, "[USBAdp] slReadBytes: %ld, [%#x %#x]\n", static_cast<long>(n), buf[0], buf[1]);
     if (n < 0) {
+        if (err == EINTR) return -1;
         USBADP_LOG(ERROR, "[USBAdp] Error in read in ReadDataClassifier, errno: %d\n", err);
+        idleRestOfPeriod(start, period);
         return -1;
     }
     // Ready but nothing to read: counts as no data.
-    if (n == 0) return -1;
+    if (n == 0) {
+        if (revents & (POLLHUP | POLLERR | POLLNVAL)) idleRestOfPeriod(start, period);
+        return -1;
+    }
     return static_cast<S32>(n);
 }
 
@@ -341,16 +350,24 @@ void USBAdapter_ReadPass(void) {
     const TPrintDelivery &d = USBPrint_Delivery();
     USBADP_LOG(DEBUG, "[USBAdp]Prn file Handle fdPrn is [%d],readFlag:%d,PollTimeout:%d\n", fdPrn.load(), readFlag,
                slPollTimeout);
-    S32 got = USBAdapter_ReadDataClassifier(aubcommand);
-    if (got == -1) {
-        onSilence(d);
-        return;
-    }
-
     S32 firmRes = 0;
     TUSBAdp_ParserID enParserID = enOther;
     bool readMore = false;
-    if (got == 1) {
+    if (startUELFlag == 1) {
+        // The last chunk ended inside a UEL: what comes next is its rest, not a
+        // new stream for the classifier. Read it at once, so a closing UEL cut
+        // after its 7th or 8th byte ends the job without waiting for silence.
+        short revents = 0;
+        if (pollPrn(slPollTimeout, &revents) < 1) {
+            if (!shouldPark()) onSilence(d);
+            return;
+        }
+        readMore = true;
+    } else if (S32 got = USBAdapter_ReadDataClassifier(aubcommand); got == -1) {
+        // Parking ends an open job on the way out, not as a silence.
+        if (!shouldPark()) onSilence(d);
+        return;
+    } else if (got == 1) {
         // One byte and then nothing: it cannot select an application.
         firmware_command[0] = aubcommand[0];
         firmRes = 1;
@@ -384,7 +401,7 @@ void USBAdapter_ReadPass(void) {
         USBADP_LOG(DEBUG, "[USBAdp] slRet from poll: %d\n", slRet);
         if (revents) USBADP_LOG(DEBUG, "[USBAdp]n revents in fd[0]: %d\n", revents);
         if (slRet > 0) {
-            ssize_t n = ::read(fdPrn.load(), received_data, RX_BUFFER_SIZE);
+            ssize_t n = Wait_Read(fdPrn.load(), received_data, RX_BUFFER_SIZE, shouldPark);
             if (n > 0) {
                 prn_read_ret = static_cast<S32>(n);
                 USBADP_LOG(DEBUG, "[USBAdp]Got the data with size[%d]\n", prn_read_ret);
@@ -411,6 +428,20 @@ void USBAdapter_ReadPass(void) {
     frameChunk(d);
 }
 
+void USBAdapter_EndJobOnPark(void) {
+    const TPrintDelivery &d = USBPrint_Delivery();
+    if (readFlag != 1) {
+        // Held UEL bytes with no job: delivered as after silence, or they would
+        // be taken for the start of whatever the host sends after re-plugging.
+        if (startUELFlag == 1) onSilence(d);
+        return;
+    }
+    USBADP_LOG(INFO, "[USBAdp]NotifyEndOfData() called when usb cable is plugged out in between of data transfer\n");
+    passHeldBytes(d);
+    d.NotifyEndOfData();
+    InitializeVars();
+}
+
 void StartReading(void) {
     USBADP_LOG(INFO, "[USBAdp]Inside StartReading().\n");
     MAA_DummyUsbSpeed();
@@ -421,14 +452,7 @@ void StartReading(void) {
     for (;;) {
         IsCanClose = hibernation_flag.load() == 1 ? 1 : 0;
         while (!shouldPark()) USBAdapter_ReadPass();
-        if (readFlag == 1) {
-            USBADP_LOG(INFO,
-                       "[USBAdp]NotifyEndOfData() called when usb cable is plugged out in between of data transfer\n");
-            const TPrintDelivery &d = USBPrint_Delivery();
-            passHeldBytes(d);
-            d.NotifyEndOfData();
-            InitializeVars();
-        }
+        USBAdapter_EndJobOnPark();
         ::sleep(1);
     }
 }

@@ -41,3 +41,6 @@ void InitializeVars(void);
 // buffers (once; 1 when they are there) and one turn of the inner loop.
 S32 USBAdapter_AllocateReadBuffers(void);
 void USBAdapter_ReadPass(void);
+// What the loop does when it parks (cable pulled, channel closing): an open
+// job ends with whatever it holds.
+void USBAdapter_EndJobOnPark(void);

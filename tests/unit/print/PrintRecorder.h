@@ -151,6 +151,10 @@ protected:
         USBPrint_SetDelivery(&rec::kRecorder);
         ASSERT_EQ(USBAdapter_AllocateReadBuffers(), 1);
         ResetReader();
+        // The reader runs its passes only while the host has configured the device.
+        IsConfigured = 1;
+        IsDisconnected = 0;
+        hibernation_flag = 0;
         fdPrn = ::open(vdev::kPrn, O_RDWR);
         ASSERT_GT(fdPrn.load(), 0);
         vdev::SetInstantTimeouts(vdev::kPrn, true);
@@ -158,6 +162,8 @@ protected:
     void TearDown() override {
         if (fdPrn > 0) ::close(fdPrn);
         fdPrn = 0;
+        IsConfigured = 0;
+        IsDisconnected = 0;
         USBPrint_SetDelivery(nullptr);
         vdev::Reset();
     }

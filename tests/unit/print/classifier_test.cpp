@@ -219,14 +219,30 @@ TEST_F(Classifier, UnreadableBodyFailsDcuButSendsNdAndFaxdHeadersToPrintData) {
     EXPECT_TRUE(rec::Apps().empty());
 }
 
-TEST_F(Classifier, BodyIsGivenUpWhenTheCableIsPulled) {
-    std::string hdr = AppHeader(0x07, 10);
-    IsDisconnected = 1;
-    Outcome o = Classify(hdr.substr(0, 2), {hdr.substr(2), "part"});
-    IsDisconnected = 0;
-    EXPECT_EQ(o.result, -2);
-    EXPECT_TRUE(rec::Apps().empty());
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [DCU] Error in reading from fdPrn, slDCUXMLPacketLen: 10, errno: 0\n"), 1);
+// What the host had sent of a body is gone with the cable: the packet is
+// dropped, and its header is no print job either.
+TEST_F(Classifier, BodyCutByACablePullIsDroppedAndMakesNoPrintJob) {
+    const struct {
+        U8 app;
+        const char *line;
+    } rows[] = {
+        {0x07, "[USBAdp] [DCU] Body cut after 4 of 10 bytes, packet dropped\n"},
+        {0x0D, "[USBAdp] [ND] Body cut after 4 of 10 bytes, packet dropped\n"},
+        {0x0E, "[USBAdp] [FAXD] Body cut after 4 of 10 bytes, packet dropped\n"},
+    };
+    for (const auto &r : rows) {
+        SCOPED_TRACE(int{r.app});
+        rec::Clear();
+        vdev::HostWrite(vdev::kPrn, AppHeader(r.app, 10));
+        vdev::HostWrite(vdev::kPrn, "part");
+        IsDisconnected = 1;  // the pull comes while the reader waits for the rest
+        USBAdapter_ReadPass();
+        IsDisconnected = 0;
+        EXPECT_TRUE(rec::Events().empty());
+        EXPECT_EQ(LoggerHost_Count(r.line), 1);
+        EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in executing Host App\n"), 1);
+        LoggerHost_StartCapture();
+    }
 }
 
 TEST_F(Classifier, JavaRefusingTheTransferIsAFailure) {

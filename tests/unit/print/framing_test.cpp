@@ -217,6 +217,39 @@ TEST_F(Framing, LooseStreamsPassEveryByteOnceWhereverTheyAreCut) {
     }
 }
 
+// A UEL cut after any of its bytes 1..8 at the end of a transfer is carried
+// over and recognised in the next read: the opening and the closing UEL of
+// each job, the tail alone in a transfer or with more data behind it. Every
+// variant gives the jobs of the uncut stream, and no job waits for silence.
+TEST_F(Framing, UelCutAfterAnyOfItsBytesIsRecognisedInTheNextRead) {
+    const std::vector<std::string> jobs = {Framed("@PJL JOB\r\nfirst page"), Framed("@PJL JOB\r\nsecond")};
+    const std::string stream = jobs[0] + jobs[1];
+    // Where each UEL of the stream begins.
+    const size_t uels[] = {0, jobs[0].size() - kUel.size(), jobs[0].size(), stream.size() - kUel.size()};
+    LoggerHost_StopCapture();
+    for (size_t at : uels) {
+        for (size_t k = 1; k < kUel.size(); ++k) {
+            const size_t cut = at + k, tailEnd = at + kUel.size();
+            const std::vector<std::vector<std::string>> variants = {
+                CutAt(stream, {cut}),           // the tail with more data behind it
+                CutAt(stream, {cut, tailEnd}),  // the tail alone in a transfer
+            };
+            for (size_t v = 0; v < variants.size(); ++v) {
+                SCOPED_TRACE(testing::Message() << "UEL at " << at << " cut after byte " << k << ", variant " << v);
+                rec::Clear();
+                ResetReader();
+                vdev::Reset();
+                fdPrn = ::open(vdev::kPrn, O_RDWR);
+                vdev::SetInstantTimeouts(vdev::kPrn, true);
+                Send(variants[v], false);
+                ExpectJobs(jobs);
+                EXPECT_EQ(vdev::ExpiredPolls(vdev::kPrn), 0u) << "a job waited for silence";
+                if (HasFailure()) return;
+            }
+        }
+    }
+}
+
 // ---- large jobs --------------------------------------------------------------
 
 std::string RandomBytes(size_t size, uint64_t seed) {

@@ -1,0 +1,180 @@
+// The session when the channel misbehaves: signals landing in its waits (the
+// bridge's SIGIO reaches whatever thread the kernel picks), a channel that
+// reports readiness and gives nothing, and a cable pulled in the middle of a
+// start command.
+#include <pthread.h>
+#include <time.h>
+
+#include <atomic>
+#include <thread>
+
+#include "maa_session/SessionFixture.h"
+#include "print/PrintRecorder.h"
+#include "support/SignalStorm.h"
+#include "support/WaitUntil.h"
+
+namespace maasession {
+namespace {
+
+class SessionSignals : public SessionTest {
+protected:
+    // The session on this thread under a SIGIO storm while `host` plays the
+    // host on another; the cable is pulled if it is still running after 10 s.
+    Outcome SessionUnderSignals(const std::function<void()> &host) {
+        std::atomic<bool> done{false};
+        std::thread h([&] {
+            host();
+            if (!WaitUntil([&] { return done.load(); }, 10000)) {
+                ADD_FAILURE() << "the session is still running";
+                IsDisconnected = 1;
+                vdev::ExpirePoll(vdev::kPrn, 100);
+            }
+        });
+        U8 cmd[COMMAND_SIZE] = {0x1B, 'w'};
+        S32 ret;
+        {
+            SignalStorm storm(pthread_self());
+            ret = MAA_Hook(static_cast<U32>(fd), cmd);
+        }
+        done = true;
+        h.join();
+        return {ret, std::string(reinterpret_cast<char *>(cmd), sizeof cmd), Str(vdev::HostRead(vdev::kPrn))};
+    }
+
+    // The host sends `bytes` once the device has taken everything before them
+    // and waited a little (so the device is inside its wait).
+    static void SendLate(const std::string &bytes) {
+        WaitUntil([] { return vdev::PendingHostBytes(vdev::kPrn) == 0; }, 5000);
+        std::this_thread::sleep_for(std::chrono::milliseconds(60));
+        vdev::HostWrite(vdev::kPrn, bytes);
+    }
+};
+
+TEST_F(SessionSignals, StartCommandArrivingLateStillOpensTheSession) {
+    Outcome o = SessionUnderSignals([] {
+        SendLate("MAAST");
+        SendLate("ART");
+        SendLate("probe(2)\r");
+        SendLate("MAA-STOP\r");
+    });
+    EXPECT_EQ(o.ret, 0) << "a signal was taken for the end of the start command";
+    EXPECT_EQ(o.wire, kAck + Frame(1, 2, "probe 2") + kAck);
+    EXPECT_GT(SignalStorm::Delivered(), 0);
+}
+
+TEST_F(SessionSignals, DownloadArrivingInPiecesIsNotCutShort) {
+    // Were the download cut short, its rest would run as command lines.
+    const std::string file = "probe(9)\rprobe(9)\rprobe(9)\r";
+    Outcome o = SessionUnderSignals([&] {
+        SendLate("MAASTART");
+        SendLate(Special(MAA_FILE_TRANS_H2T, static_cast<U32>(file.size())) + file.substr(0, 4));
+        SendLate(file.substr(4, 10));
+        SendLate(file.substr(14));
+        SendLate("probe(5)\rMAA-STOP\r");
+    });
+    EXPECT_EQ(o.ret, 0);
+    EXPECT_EQ(probes, std::vector<U32>{5});
+    ASSERT_EQ(o.wire.size(), kAck.size() + 4 + Frame(1, 5, "probe 5").size() + kAck.size());
+    EXPECT_EQ(o.wire.substr(12), Frame(1, 5, "probe 5") + kAck);
+}
+
+// A channel that says it is ready and gives nothing: hung up (the node's
+// descriptor is dead) or closed. The line reader waits out each poll period
+// instead of asking again at once, and the pulled cable still ends it.
+TEST_F(SessionTest, LineReaderDoesNotSpinOnAChannelThatGivesNothing) {
+    const int closed = ::dup(fd);
+    ::close(closed);
+    const struct {
+        const char *name;
+        int handle;
+    } rows[] = {{"hung up", fd}, {"closed", closed}};
+    vdev::Reset();
+    for (const auto &r : rows) {
+        SCOPED_TRACE(r.name);
+        IsDisconnected = 0;
+        maa_session::slPollTimeout = MAA_POLL_TIMEOUT;
+        std::thread puller([] {
+            std::this_thread::sleep_for(std::chrono::milliseconds(600));
+            IsDisconnected = 1;
+        });
+        timespec before, after;
+        clock_gettime(CLOCK_THREAD_CPUTIME_ID, &before);
+        const auto start = std::chrono::steady_clock::now();
+        U8 buf[MAA_LINE_BUFFER_SIZE];
+        MAA_ReadLine(static_cast<U32>(r.handle), buf);
+        clock_gettime(CLOCK_THREAD_CPUTIME_ID, &after);
+        const long wallMs = static_cast<long>(std::chrono::duration_cast<std::chrono::milliseconds>(
+                                                  std::chrono::steady_clock::now() - start)
+                                                  .count());
+        puller.join();
+        const long cpuMs = (after.tv_sec - before.tv_sec) * 1000 + (after.tv_nsec - before.tv_nsec) / 1000000;
+        EXPECT_EQ(buf[0], 0);
+        EXPECT_GE(wallMs, 500);
+        EXPECT_LT(wallMs, 3000) << "the pulled cable is noticed while waiting";
+        EXPECT_LT(cpuMs, wallMs / 5) << "the line reader spun";
+    }
+    IsDisconnected = 0;
+}
+
+// ---- through the reader: a cable pulled in the middle of a start command -------
+
+class StartCommandPull : public ReaderTest {
+protected:
+    void TearDown() override {
+        MAA_SetResultWriter(nullptr);
+        ReaderTest::TearDown();
+    }
+};
+
+// The bridge loses what the host had in flight when the cable goes, so no rest
+// of the start command is read as the beginning of the next job.
+TEST_F(StartCommandPull, NextPrintJobAfterReplugIsByteExact) {
+    const std::string start = "\x1bwMAASTART";
+    const std::string job = kUel + "@PJL JOB\r\npage" + kUel;
+    LoggerHost_StopCapture();
+    for (size_t k = 1; k < start.size(); ++k) {
+        SCOPED_TRACE(testing::Message() << "pulled after " << k << " bytes");
+        rec::Clear();
+        ResetReader();
+        IsConfigured = 1;
+        IsDisconnected = 0;
+        maa_session::slPollTimeout = MAA_POLL_TIMEOUT;
+        vdev::SetInstantTimeouts(vdev::kPrn, false);
+        vdev::HostWrite(vdev::kPrn, start.substr(0, k));
+        std::thread puller([&, k] {
+            // The reader has taken the first k bytes and waits for the rest;
+            // the rest is in flight when the cable goes.
+            WaitUntil([] { return vdev::PendingHostBytes(vdev::kPrn) == 0; }, 5000);
+            std::this_thread::sleep_for(std::chrono::milliseconds(20));
+            vdev::HostWrite(vdev::kPrn, start.substr(k));
+            mfp_notif_t pull{};
+            pull.ub_notif = MFP_DEV_DISCONNECT;
+            pull.ub_intf = eMfp_Notif_Both;
+            vdev::QueueNotification(vdev::kPrn, pull);
+            IsConfigured = 0;
+            IsDisconnected = 1;
+            vdev::ExpirePoll(vdev::kPrn, 10);
+        });
+        USBAdapter_ReadPass();
+        puller.join();
+        USBAdapter_EndJobOnPark();
+        const size_t before = rec::Jobs().size();
+
+        // Plugged in again; the host sends a print job.
+        IsDisconnected = 0;
+        IsConfigured = 1;
+        vdev::SetInstantTimeouts(vdev::kPrn, true);
+        Send({job});
+        auto jobs = rec::Jobs();
+        ASSERT_EQ(jobs.size(), before + 1);
+        EXPECT_EQ(jobs.back().bytes, job);
+        EXPECT_TRUE(jobs.back().ended);
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 0u);
+        vdev::Reset();
+        fdPrn = ::open(vdev::kPrn, O_RDWR);
+        if (HasFailure()) return;
+    }
+}
+
+}  // namespace
+}  // namespace maasession

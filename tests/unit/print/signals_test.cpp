@@ -1,0 +1,110 @@
+// The reader under the bridge's signals: SIGIO lands on the reader's thread in
+// the middle of its waits. A signal is no time-out, no error and no empty read:
+// nothing changes at the Java side, and silence still ends a job on time.
+// Also: a node that reports readiness but gives nothing must not make the
+// reader spin.
+#include <pthread.h>
+#include <time.h>
+
+#include <atomic>
+#include <chrono>
+#include <thread>
+
+#include "print/PrintRecorder.h"
+#include "support/SignalStorm.h"
+#include "support/WaitUntil.h"
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+class ReaderSignals : public ReaderTest {
+protected:
+    void SetUp() override {
+        ReaderTest::SetUp();
+        // Real time: the waits must really be waits for a signal to land in.
+        vdev::SetInstantTimeouts(vdev::kPrn, false);
+    }
+
+    // Runs `pass` on this thread under a SIGIO storm while `host` plays the
+    // host on another; parks the reader if it is still waiting after 5 s.
+    static long PassUnderSignals(void (*pass)(), const std::function<void()> &host) {
+        std::atomic<bool> done{false};
+        std::thread h([&] {
+            host();
+            if (!WaitUntil([&] { return done.load(); }, 5000)) {
+                ADD_FAILURE() << "the reader is still waiting";
+                IsConfigured = 0;
+            }
+        });
+        const auto start = Clock::now();
+        {
+            SignalStorm storm(pthread_self());
+            pass();
+        }
+        const long ms = static_cast<long>(
+            std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - start).count());
+        done = true;
+        h.join();
+        IsConfigured = 1;
+        return ms;
+    }
+};
+
+TEST_F(ReaderSignals, JobWithoutUelEndsAfterOneSilencePeriod) {
+    slPollTimeout = 300;  // the silence period, shortened
+    vdev::HostWrite(vdev::kPrn, "page data without any UEL");
+    USBAdapter_ReadPass();
+    ASSERT_EQ(rec::Jobs().size(), 1u);
+    const long ms = PassUnderSignals(USBAdapter_ReadPass, [] {});
+    auto jobs = rec::Jobs();
+    ASSERT_EQ(jobs.size(), 1u);
+    EXPECT_EQ(jobs[0].bytes, "page data without any UEL");
+    EXPECT_TRUE(jobs[0].ended);
+    EXPECT_GE(ms, 250);
+    EXPECT_LT(ms, 3000) << "signals postponed the end of the silence";
+    EXPECT_EQ(LoggerHost_Count("[USBAdp]NotifyEndOfData() called -- 2\n"), 1);
+    EXPECT_FALSE(LoggerHost_Contains("Error in poll"));
+}
+
+TEST_F(ReaderSignals, ApplicationHeaderArrivingLateIsNotDropped) {
+    const std::string nd = {'\x1b', '\x91', 0, 0, 0, 0, 0, 0x0D, 0, 0, 0, 0, 0, 0, 0, 0};
+    vdev::HostWrite(vdev::kPrn, nd.substr(0, 2));
+    PassUnderSignals(USBAdapter_ReadPass, [&] {
+        // The header's rest comes while the classifier waits in its read.
+        WaitUntil([] { return vdev::PendingHostBytes(vdev::kPrn) == 0; }, 2000);
+        std::this_thread::sleep_for(std::chrono::milliseconds(100));
+        vdev::HostWrite(vdev::kPrn, nd.substr(2));
+    });
+    auto apps = rec::Apps();
+    ASSERT_EQ(apps.size(), 1u);
+    EXPECT_EQ(apps[0].type, "networkrds");
+    EXPECT_EQ(apps[0].writes, (std::vector<std::string>{nd}));
+    EXPECT_TRUE(rec::Jobs().empty());
+    EXPECT_GT(SignalStorm::Delivered(), 0);
+}
+
+// A node that says it is ready and then gives nothing (here: hung up). The
+// reader lets each poll period pass instead of asking again at once.
+TEST_F(ReaderSignals, HungUpNodeDoesNotMakeTheReaderSpin) {
+    slPollTimeout = 5000;
+    vdev::Reset();  // the reader's descriptor is dead: ready, and reads give 0
+    std::thread parker([] {
+        std::this_thread::sleep_for(std::chrono::milliseconds(600));
+        IsConfigured = 0;
+    });
+    timespec before, after;
+    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &before);
+    const auto start = Clock::now();
+    for (int passes = 0; IsConfigured && passes < 1000000; ++passes) USBAdapter_ReadPass();
+    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &after);
+    const long wallMs =
+        static_cast<long>(std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - start).count());
+    parker.join();
+    const long cpuMs = (after.tv_sec - before.tv_sec) * 1000 + (after.tv_nsec - before.tv_nsec) / 1000000;
+    EXPECT_GE(wallMs, 500);
+    EXPECT_LT(wallMs, 3000) << "parking is noticed while idling";
+    EXPECT_LT(cpuMs, wallMs / 5) << "the reader spun on a node with nothing to give";
+}
+
+}  // namespace
