@@ -22,6 +22,14 @@ constexpr int kInterpreterCount = 15;
 
 std::atomic<JavaVM *> printVM{nullptr};
 
+// Held by the readPrintMsg call that owns the print globals, for as long as it
+// runs: another call would delete references the reader still uses.
+std::atomic<bool> printEntryBusy{false};
+
+struct PrintEntryClaim {
+    ~PrintEntryClaim() { printEntryBusy.store(false); }
+};
+
 const TPrintDelivery kUpcalls = {RegisterJob, PassData, NotifyEndOfData, SendAppType, SendAppBuf, NotifyAppEnd};
 std::atomic<const TPrintDelivery *> delivery{&kUpcalls};
 
@@ -342,6 +350,12 @@ Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIServ
         USBADP_LOG(ERROR, "[USBAdp] JNI environment received is NULL\n");
         return;
     }
+    bool idle = false;
+    if (!printEntryBusy.compare_exchange_strong(idle, true)) {
+        USBADP_LOG(ERROR, "[USBAdp] readPrintMsg: the print reader is already running\n");
+        return;
+    }
+    PrintEntryClaim claim;
     globalPrintEnv = env;
     JavaVM *vm = nullptr;
     if (env->GetJavaVM(&vm) == JNI_OK) printVM = vm;

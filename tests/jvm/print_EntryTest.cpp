@@ -1,11 +1,18 @@
-// The readPrintMsg entry: the objects it keeps, the ones it lets go, and the
-// strings it cannot do without.
+// The readPrintMsg entry: the objects it keeps, the ones it lets go, the
+// strings it cannot do without, and the one reader it lets run at a time.
+#include <algorithm>
+#include <atomic>
+#include <memory>
+
 #include "print_Hidden.h"
 #include "print_Support.h"
 
 namespace {
 
+using printjvm::kUel;
 using printjvm::ReadPrintMsg;
+
+const std::string kAlreadyRunning = "[USBAdp] readPrintMsg: the print reader is already running\n";
 
 // A new object of `cls` held only through a global reference the test drops
 // itself, and a weak reference that tells whether anything still holds it.
@@ -68,48 +75,63 @@ TEST_F(PrintEntry, EachNullStringIsNamed) {
     EXPECT_EQ(LoggerHost_Count("[USBAdp] Deleting Global reference of print\n"), 0);
 }
 
-TEST_F(PrintEntry, SecondCallReleasesTheObjectsOfTheFirst) {
-    // The service queues exist, so a reader that gets in waits on its queue for good.
-    StartReader(fixtures::kRecordingDaemon, false);
+TEST_F(PrintEntry, CallAfterAFailedOneReleasesItsMaaObjectAndStartsTheReader) {
+    Tracked daemon1 = Make(fixtures::kRecordingDaemon), maa1 = Make(fixtures::kRecordingMaa);
+    CreateQueues(daemon1.global);
     if (HasFatalFailure()) return;
-    Tracked maa1 = Make(fixtures::kRecordingMaa);
     jvm::RunOnThread(
-        [&](JNIEnv *env) { ReadPrintMsg(env, daemon_, maa1.global, "Tarnwel", "TW-4020", nullptr); }, "entry-1");
+        [&](JNIEnv *env) { ReadPrintMsg(env, daemon1.global, maa1.global, "Tarnwel", "TW-4020", nullptr); },
+        "entry-1");
     Drop(maa1);
     LoggerHost_StartCapture();
 
-    // A full entry on a thread of its own: it releases the kept MAA object.
     Tracked daemon2 = Make(fixtures::kDaemonWithoutUpcalls), maa2 = Make(fixtures::kRecordingMaa);
     jobject d2 = daemon2.global, m2 = maa2.global;
     jvm::StartDetached([d2, m2](JNIEnv *env) { ReadPrintMsg(env, d2, m2, "Tarnwel", "TW-4020", "printer"); },
                        "entry-2");
     ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp]Inside USBAdapter_IF_PrintFunction"); }));
+    EXPECT_EQ(LoggerHost_Count(kAlreadyRunning), 0);
     EXPECT_EQ(LoggerHost_Count("[USBAdp-MAA] Deleting Global reference of print\n"), 1);
     EXPECT_EQ(LoggerHost_Count("[USBAdp] Deleting Global reference of print\n"), 0);
     EXPECT_TRUE(Collected(maa1)) << "the first MAA object is still held";
-
-    // And a third entry replaces the daemon of the second.
-    LoggerHost_StartCapture();
-    jvm::RunOnThread([&](JNIEnv *env) { ReadPrintMsg(env, daemon_, maa_, "Tarnwel", "TW-4020", nullptr); },
-                     "entry-3");
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] Deleting Global reference of print\n"), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] Global reference of print deleted successfully\n"), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp-MAA] Deleting Global reference of print\n"), 1);
 }
 
-TEST_F(PrintEntry, QueriesGoToTheDaemonOfTheLatestCall) {
-    StartReader(fixtures::kDaemonWithoutUpcalls, false);
+// Another Java thread entering while the reader runs must not take the
+// reader's objects from under it, nor start a second reader on them.
+TEST_F(PrintEntry, CallWhileTheReaderRunsIsRefusedAndTheReaderKeepsItsObjects) {
+    StartReader();
     if (HasFatalFailure()) return;
+    auto *readerEnv = hidden::Variable<std::atomic<JNIEnv *>>("globalPrintEnv");
     auto fetch = hidden::Function<U32()>("fetchPrinterStatus()");
-    ASSERT_NE(fetch, nullptr);
-    EXPECT_EQ(fetch(), 0u);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp][USBPrint] GetMethodID returned NULL in fetchPrinterStatus()\n"), 1);
+    ASSERT_TRUE(readerEnv && fetch);
+    JNIEnv *envBefore = readerEnv->load();
+    LoggerHost_StartCapture();
 
-    jobject recording = jvm::New(fixtures::kRecordingDaemon);
-    jobject maa = maa_;
-    jvm::StartDetached([recording, maa](JNIEnv *env) { ReadPrintMsg(env, recording, maa, "T", "M", "C"); },
-                       "entry-2");
-    ASSERT_TRUE(WaitUntil([] { return LoggerHost_Count("[USBAdp] Global reference of print deleted successfully\n") == 1; }));
+    // Objects without call-backs: a job or query that reached them would fail.
+    jobject daemon2 = jvm::New(fixtures::kDaemonWithoutUpcalls), maa2 = jvm::New(fixtures::kRecordingMaa);
+    auto returned = std::make_shared<std::atomic<bool>>(false);
+    jvm::StartDetached(
+        [daemon2, maa2, returned](JNIEnv *env) {
+            ReadPrintMsg(env, daemon2, maa2, "Other", "TW-9999", "printer");
+            *returned = true;
+        },
+        "entry-2");
+    ASSERT_TRUE(WaitUntil([&] { return returned->load(); }, 5000)) << "the second call did not return";
+    EXPECT_EQ(LoggerHost_Count(kAlreadyRunning), 1);
+    const std::vector<LoggedLine> lines = LoggerHost_Captured();
+    EXPECT_TRUE(std::any_of(lines.begin(), lines.end(), [](const LoggedLine &l) {
+        return l.text == kAlreadyRunning && l.levelName == "ERROR";
+    })) << "the refusal is not logged as an error";
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] Deleting Global reference of print\n"), 0);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp-MAA] Deleting Global reference of print\n"), 0);
+    EXPECT_FALSE(LoggerHost_Contains("[USBAdp]Inside USBAdapter_IF_PrintFunction"));
+    EXPECT_EQ(readerEnv->load(), envBefore);
+
+    const std::string job = kUel + "for the first daemon" + kUel;
+    vdev::HostWrite(vdev::kPrn, job);
+    ASSERT_TRUE(fixtures::AwaitJobEnded(0, 10000));
+    EXPECT_EQ(fixtures::JobBytes(0), job);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in RegisterJob()::can't find processPrintCommand().\n"), 0);
     fixtures::SetPrinterStatus(2);
     EXPECT_EQ(fetch(), 2u);
     EXPECT_EQ(fixtures::Calls("getPrinterStatus"), 1);

@@ -72,11 +72,8 @@ protected:
         daemon_ = jvm::New(daemonClass);
         maa_ = jvm::New(fixtures::kRecordingMaa);
         ASSERT_NE(daemon_, nullptr);
-        JNIEnv *env = jvm::Env();
-        jstring model = jvm::Str(env, "TW-4020 MFP");
-        jvm::CallVoid(daemon_, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", model);
-        env->DeleteLocalRef(model);
-        ASSERT_GE(QueueOf(root_, 5), 0);
+        CreateQueues(daemon_);
+        if (HasFatalFailure()) return;
         jobject daemon = daemon_, maa = maa_;
         jvm::StartDetached(
             [daemon, maa](JNIEnv *e) { printjvm::ReadPrintMsg(e, daemon, maa, "Tarnwel", "TW-4020 MFP", "printer"); },
@@ -90,6 +87,16 @@ protected:
         ASSERT_TRUE(vdev::AsyncEnabled(vdev::kPrn));
         vdev::QueueNotification(vdev::kPrn, printjvm::Notification(MFP_DEV_CONFIGURED));
         ASSERT_TRUE(WaitUntil([] { return vdev::PollTimeouts(vdev::kPrn).size() >= 1; }));
+    }
+
+    // The service queues, made through `service`: a reader that gets in then
+    // waits on its queue.
+    void CreateQueues(jobject service) {
+        JNIEnv *env = jvm::Env();
+        jstring model = jvm::Str(env, "TW-4020 MFP");
+        jvm::CallVoid(service, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", model);
+        env->DeleteLocalRef(model);
+        ASSERT_GE(QueueOf(root_, 5), 0);
     }
 
     // The host's silence: the reader's waiting poll times out now. Call it when
