@@ -23,7 +23,7 @@ bool cableGone() { return MAA_IsUSBDisconnected() != 0; }
 
 }  // namespace
 
-U32 DM_ReadDriver(U32 ulHandle, U8 **pubbufPtr, U32 ulReadSize, U32 *pulReturnSize, TDMCallback) {
+U32 DM_ReadDriverInto(U32 ulHandle, U8 *pubDest, U32 ulReadSize, U32 *pulReturnSize) {
     *pulReturnSize = 0;
     if (MAA_IsUSBDisconnected()) {
         USBADP_LOG(ERROR, "\r\n[MAA] ReadDriver: USB Disconnected");
@@ -34,30 +34,35 @@ U32 DM_ReadDriver(U32 ulHandle, U8 **pubbufPtr, U32 ulReadSize, U32 *pulReturnSi
     const int64_t start = Wait_NowMs();
     short revents = 0;
     int r = Wait_PollIn(fd, period, &revents, cableGone);
-    if (r == 0 && period == MAA_POLL_TIMEOUT_FIRST) maa_session::slPollTimeout = MAA_POLL_TIMEOUT;
+    bool stopped = r < 0 && errno == EINTR;  // the cable went while waiting
     ssize_t count = 0;
     if (r < 1) {
         USBADP_LOG(DEBUG, "\r\n[MAA] No Data to read\n");
     } else {
-        const size_t want = std::clamp<U32>(ulReadSize, 1, DM_READ_PIECE_MAX);
-        count = Wait_Read(fd, aubDMBuf, want, cableGone);
+        count = Wait_Read(fd, pubDest, std::clamp<U32>(ulReadSize, 1, DM_READ_PIECE_MAX), cableGone);
+        stopped = count < 0 && errno == EINTR;
     }
     if (count < 1) {
         USBADP_LOG(DEBUG, "\r\n Serial Read Error\\No data");
         // Ready and yet nothing (hung up, closed, an error, an empty read): the
         // period is over only when its time is, or the line readers that retry
         // on a time-out would spin.
-        if (r > 0 || (r < 0 && errno != EINTR))
-            Wait_Idle(static_cast<int>(period - (Wait_NowMs() - start)), cableGone);
+        if (!stopped && r != 0) Wait_Idle(static_cast<int>(period - (Wait_NowMs() - start)), cableGone);
+        if (!stopped && period == MAA_POLL_TIMEOUT_FIRST) maa_session::slPollTimeout = MAA_POLL_TIMEOUT;
         if (MAA_IsUSBDisconnected()) {
             USBADP_LOG(ERROR, "\r\n[MAA] ReadDriver: USB Disconnected");
             return DM_RET_USB_DISCONNECTED;
         }
         return DM_RET_TIMEOUT;
     }
-    *pubbufPtr = aubDMBuf;
     *pulReturnSize = static_cast<U32>(count);
     return DM_RET_OK;
+}
+
+U32 DM_ReadDriver(U32 ulHandle, U8 **pubbufPtr, U32 ulReadSize, U32 *pulReturnSize, TDMCallback) {
+    U32 r = DM_ReadDriverInto(ulHandle, aubDMBuf, ulReadSize, pulReturnSize);
+    if (r == DM_RET_OK) *pubbufPtr = aubDMBuf;
+    return r;
 }
 
 U32 DM_WriteDriver(U32 ulHandle, const U8 *pubBufPtr, U32 ulWriteSize, U32 *pulReturnSize, TDMCallback) {

@@ -22,6 +22,9 @@ constexpr U32 DM_READ_PIECE_MAX = 4096;
 // nothing to give also takes the whole period. DM_RET_USB_DISCONNECTED once
 // the cable is gone. A signal is not a time-out: the wait goes on.
 U32 DM_ReadDriver(U32 ulHandle, U8 **pubbufPtr, U32 ulReadSize, U32 *pulReturnSize, TDMCallback ptfDRP);
+// The same into the caller's buffer (room for min(ulReadSize, DM_READ_PIECE_MAX)
+// bytes), without the copy: for downloads.
+U32 DM_ReadDriverInto(U32 ulHandle, U8 *pubDest, U32 ulReadSize, U32 *pulReturnSize);
 // Writes the whole buffer. DM_RET_OK even after a write error (logged), so
 // callers only ever see a disconnect.
 U32 DM_WriteDriver(U32 ulHandle, const U8 *pubBufPtr, U32 ulWriteSize, U32 *pulReturnSize, TDMCallback pnfDRP);

@@ -54,18 +54,20 @@ S32 handBack(U8 *command, const U8 *start, U32 count, const char *tag) {
     return static_cast<S32>(count);
 }
 
-// Replaces the buffer of a heap handle with a zeroed one of ulSize bytes.
-bool reallocHeap(MAAHeapHandle &heap, U32 ulSize) {
+// Replaces the buffer of a heap handle with one of ulSize bytes, zeroed when
+// its contents will be read (the saved commands rely on zero bytes).
+bool reallocHeap(MAAHeapHandle &heap, U32 ulSize, bool zeroed) {
     if (heap.ulHeapPtr != nullptr || heap.ulHeapSize != 0) {
         MAA_HeapFree(heap.ulHeapPtr, 0);
         heap = {};
     }
-    U8 *p = ulSize <= MAA_HEAP_REQUEST_MAX ? static_cast<U8 *>(MAA_HeapAlloc(ulSize, 0)) : nullptr;
+    void *block = nullptr;
+    if (ulSize <= MAA_HEAP_REQUEST_MAX) block = zeroed ? MAA_HeapAllocZeroed(ulSize, 0) : MAA_HeapAlloc(ulSize, 0);
+    U8 *p = static_cast<U8 *>(block);
     if (p == nullptr) {
         USBADP_LOG(ERROR, "\r\n[MAA] Data Allocation in Heap Failed");
         return false;
     }
-    std::memset(p, 0, ulSize);
     heap = {p, ulSize, 0};
     return true;
 }
@@ -232,20 +234,23 @@ S32 MAA_CheckSpecialCommand(const U8 *ubBuf) {
     const U32 ulFileSize = ReadBE32(cmd->ulFileSize);
     switch (code) {
     case MAA_FILE_TRANS_H2T:
-        if (!reallocHeap(stDataHeap, ulFileSize)) return 0;
+        // The file goes to its own download buffer; this one only has to be
+        // had (a size that cannot be makes the line an ordinary command), and
+        // nothing ever reads it, so it is not zeroed.
+        if (!reallocHeap(stDataHeap, ulFileSize, false)) return 0;
         USBADP_LOG(INFO, "\r\n[MAA] H2T Command");
         MAA_CommandH2T(ulFileSize);
         USBADP_LOG(INFO, "\r\n[MAA]FileCommand Type    : %d", static_cast<int>(code));
         USBADP_LOG(INFO, "\r\n[MAA]FileCommand FileSize: %d", static_cast<int>(ulFileSize));
         return 1;
     case MAA_JIG_MODE_START:
-        if (!reallocHeap(stCmdHeap, ulFileSize)) return 0;
+        if (!reallocHeap(stCmdHeap, ulFileSize, true)) return 0;
         MAA_CommandJIGStart();
         USBADP_LOG(INFO, "\r\n[MAA]JIG Buffer Size    : %d", static_cast<int>(ulFileSize));
         return 1;
     case MAA_JIG_MODE_END: MAA_CommandJIGEnd(); return 1;
     case MAA_AUTO_MODE_START:
-        if (!reallocHeap(stCmdHeap, ulFileSize)) return 0;
+        if (!reallocHeap(stCmdHeap, ulFileSize, true)) return 0;
         USBADP_LOG(INFO, "\r\n[MAA]AUTO Buffer Size    : %d", static_cast<int>(ulFileSize));
         MAA_CommandAutoStart();
         return 1;

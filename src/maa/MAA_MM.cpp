@@ -21,6 +21,8 @@ void MAA_Free(void *pvPtr) { std::free(pvPtr); }
 
 void *MAA_HeapAlloc(U32 ulSize, U32 /*ulPool*/) { return std::malloc(ulSize ? ulSize : 1); }
 
+void *MAA_HeapAllocZeroed(U32 ulSize, U32 /*ulPool*/) { return std::calloc(ulSize ? ulSize : 1, 1); }
+
 void MAA_HeapFree(void *pvPtr, U32 /*ulPool*/) {
     if (pvPtr != nullptr) std::free(pvPtr);
 }
@@ -79,7 +81,9 @@ U8 *MAA_DownloadAlloc(U32 ulSize, U32 *pulAddress) {
     currentDownload = nullptr;
     currentSize = 0;
     if (ulSize > MAA_DOWNLOAD_TOTAL_MAX - downloadTotal) return nullptr;
-    U8 *p = static_cast<U8 *>(std::calloc(ulSize ? ulSize : 1, 1));
+    // Not zeroed here: the download fills it, and zeroes what a cut transfer
+    // left (MAA_DownloadZeroFrom); zeroing twice costs as much as the transfer.
+    U8 *p = static_cast<U8 *>(std::malloc(ulSize ? ulSize : 1));
     if (p == nullptr) return nullptr;
     const U32 address = ulSize != 0 ? MAA_AddrMap(p, ulSize) : 0;
     downloads.push_back({p, ulSize, address});
@@ -93,6 +97,11 @@ U8 *MAA_DownloadAlloc(U32 ulSize, U32 *pulAddress) {
 U8 *MAA_DownloadBuffer(U32 *pulSize) {
     *pulSize = currentSize;
     return currentDownload;
+}
+
+void MAA_DownloadZeroFrom(U32 ulOffset) {
+    if (currentDownload != nullptr && ulOffset < currentSize)
+        std::memset(currentDownload + ulOffset, 0, currentSize - ulOffset);
 }
 
 U32 MAA_DownloadTotal(void) { return downloadTotal; }

@@ -44,6 +44,8 @@ void *MAA_Alloc(U32 ulSize);
 void MAA_Free(void *pvPtr);
 // Process heap; the pool number is ignored. May return nullptr.
 void *MAA_HeapAlloc(U32 ulSize, U32 ulPool);
+// Zeroed, for buffers handed out clean (large ones come as untouched zero pages).
+void *MAA_HeapAllocZeroed(U32 ulSize, U32 ulPool);
 void MAA_HeapFree(void *pvPtr, U32 ulPool);
 // The segment allocator is not supported: logs and returns nullptr.
 void *MAA_SegAlloc(U32 ulSize, U32 ulPool);
@@ -57,11 +59,14 @@ void MAA_InitMem();
 // scripts download several files before passing each address to a function.
 constexpr U32 MAA_DOWNLOAD_TOTAL_MAX = 256u << 20;  // per session
 
-// A zeroed buffer of ulSize bytes for the download that follows, and its
-// address in the shell's map (0 for an empty buffer). Null, and no current
-// download, when the session's total would pass MAA_DOWNLOAD_TOTAL_MAX or
-// memory is short.
+// A buffer of ulSize bytes for the download that follows, and its address in
+// the shell's map (0 for an empty buffer). Null, and no current download, when
+// the session's total would pass MAA_DOWNLOAD_TOTAL_MAX or memory is short.
+// Its bytes are the download's: the reader of the file fills it, and zeroes
+// what a cut transfer did not fill (MAA_DownloadZeroFrom), before any test
+// function can see it.
 U8 *MAA_DownloadAlloc(U32 ulSize, U32 *pulAddress);
+void MAA_DownloadZeroFrom(U32 ulOffset);
 // The current download (the newest, null when its allocation failed) and its size.
 U8 *MAA_DownloadBuffer(U32 *pulSize);
 // Bytes the session's downloads hold.

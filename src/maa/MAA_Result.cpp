@@ -33,6 +33,8 @@ constexpr size_t kSerialStringSize = 40;
 // Lines of Dump_File. Not the session's line buffer: the parser may still be
 // reading the rest of the command line from there after the call.
 U8 aubDumpLine[MAA_LINE_SIZE + 1];
+// Where the bytes of a download without a buffer go.
+U8 aubDiscard[FILE_BUFFERSIZE];
 
 bool runMode() { return enSpecialMode == MAA_JIG_RUN_CMD || enSpecialMode == MAA_AUTO_RUN_CMD; }
 
@@ -164,21 +166,23 @@ U32 MAA_ReadFile(U32 ulFileSize) {
         const U32 piece = std::min(FILE_BUFFERSIZE, ulFileSize - total);
         USBADP_LOG(DEBUG, "\r\n[MAA:MAA_ReadFile] USB Read File %d", static_cast<int>(piece));
         for (U32 got = 0; got < piece;) {
-            U8 *p = nullptr;
+            // Straight into the download; without one (it could not be
+            // allocated) the bytes are still taken.
+            const bool fits = buffer != nullptr && total + piece <= capacity;
+            U8 *dest = fits ? buffer + total + got : aubDiscard;
             U32 n = 0;
-            U32 r = DM_ReadDriver(ulDrvHandle.load(), &p, piece - got, &n, nullptr);
+            U32 r = DM_ReadDriverInto(ulDrvHandle.load(), dest, std::min(piece - got, FILE_BUFFERSIZE), &n);
             if (r != DM_RET_OK) {
                 USBADP_LOG(ERROR, "\r\n[MAA:MAA_ReadFile] Invalid DM Read Return(%d)", static_cast<int>(r));
+                MAA_DownloadZeroFrom(total + got);
                 return 0;
             }
             if (n == 0) {
                 USBADP_LOG(ERROR, "\r\n[MAA] Read Fail ");
+                MAA_DownloadZeroFrom(total + got);
                 return 0;
             }
-            n = std::min(n, piece - got);
-            // Without a buffer (it could not be allocated) the bytes are still taken.
-            if (buffer != nullptr && total + got + n <= capacity) std::memcpy(buffer + total + got, p, n);
-            got += n;
+            got += std::min(n, piece - got);
         }
         total += piece;
         USBADP_LOG(DEBUG, "\r\n[MAA] ReadFile ( %05d )", static_cast<int>(total));

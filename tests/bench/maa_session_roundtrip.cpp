@@ -24,6 +24,9 @@
 namespace {
 
 const std::string kLine = "probe(1)\r";
+const std::string kStart = "MAASTART";
+const std::string kStop = "MAA-STOP\r";
+constexpr size_t kAckBytes = 8;
 constexpr size_t kRecordBytes = 12 + 16;  // header + "probe result 16b"
 U8 aubText[] = "probe result 16b";
 TMAAResult stResult;
@@ -57,23 +60,22 @@ public:
         if (shell_) {
             MAA_SymbolClear();
             MAA_SymbolAdd(ftarget_ppc, "probe", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<probe>(), 1);
+            // Session after session, as the reader runs them (downloads live
+            // as long as their session).
             thread_ = std::thread([this] {
-                U8 cmd[10] = {0x1B, 'w'};
-                MAA_Hook(static_cast<U32>(fd_), cmd);
+                while (!stop_) {
+                    U8 cmd[10] = {0x1B, 'w'};
+                    MAA_Hook(static_cast<U32>(fd_), cmd);
+                }
             });
-            vdev::HostWrite(vdev::kPrn, "MAASTART");
-            vdev::HostReadAtLeast(vdev::kPrn, 8, 10000);
         } else {
             thread_ = std::thread([this, take, answer] { Echo(take, answer); });
         }
     }
     ~Device() {
-        if (shell_) {
-            vdev::HostWrite(vdev::kPrn, "MAA-STOP\r");
-        } else {
-            stop_ = true;
-            vdev::HostWrite(vdev::kPrn, "x");
-        }
+        stop_ = true;
+        // Ends an open session, or is a wrong start command for the next one.
+        vdev::HostWrite(vdev::kPrn, shell_ ? kStop : "x");
         thread_.join();
         ::close(fd_);
     }
@@ -101,6 +103,10 @@ private:
 
 void RoundTrip(benchmark::State &state, bool shell) {
     Device device(shell, kLine.size(), kRecordBytes);
+    if (shell) {
+        vdev::HostWrite(vdev::kPrn, kStart);
+        Expect(kAckBytes, state);
+    }
     for (auto _ : state) {
         vdev::HostWrite(vdev::kPrn, kLine);
         Expect(kRecordBytes, state);
@@ -113,18 +119,19 @@ void BM_RoundTrip_Shell(benchmark::State &state) { RoundTrip(state, true); }
 BENCHMARK(BM_RoundTrip_Raw)->UseRealTime();
 BENCHMARK(BM_RoundTrip_Shell)->UseRealTime();
 
-// One download of range(0) bytes, then a command line: the record proves the
-// device has taken the whole file.
+// A session with one download of range(0) bytes, then a command line (its
+// record proves the device has taken the whole file), then the stop.
 void Download(benchmark::State &state, bool shell) {
     const size_t size = static_cast<size_t>(state.range(0));
     const std::string head = Special(MAA_FILE_TRANS_H2T, static_cast<U32>(size));
     std::string file(size, '\0');
     for (size_t i = 0; i < size; ++i) file[i] = static_cast<char>(i * 13);
-    const std::string transfer = head + file + kLine;
-    Device device(shell, transfer.size(), 4 + kRecordBytes);
+    const std::string transfer = kStart + head + file + kLine + kStop;
+    const size_t answer = kAckBytes + 4 + kRecordBytes + kAckBytes;
+    Device device(shell, transfer.size(), answer);
     for (auto _ : state) {
         vdev::HostWrite(vdev::kPrn, transfer);
-        Expect(4 + kRecordBytes, state);
+        Expect(answer, state);
     }
     state.SetBytesProcessed(static_cast<int64_t>(state.iterations() * size));
 }

@@ -4,6 +4,7 @@
 
 #include "maa_session/SessionFixture.h"
 #include "print/PrintRecorder.h"
+#include "support/WaitUntil.h"
 
 namespace maasession {
 namespace {
@@ -117,6 +118,23 @@ TEST_F(SessionTest, DownloadSendsItsAddressAndTakesExactlyTheAnnouncedBytes) {
     EXPECT_GE(address, MAA_ADDR_BASE);
     EXPECT_EQ(early.substr(12) + o.wire, Frame(1, 4, "probe 4") + Frame(1, 1, raw) + Frame(1, 1, "unreachable") + kAck)
         << "the line behind the file is whole; the buffer is exactly the announced size";
+}
+
+// A download the host stops sending in the middle ends at the time-out; what
+// did not arrive reads as zero bytes.
+TEST_F(SessionTest, DownloadCutByATimeOutLeavesZerosWhereNothingArrived) {
+    MAA_SymbolAdd(ftarget_ppc, "peek", MAA_SYM_FUNC, MAA_FuncEntry<peek>(), 2);
+    std::string early;
+    Outcome o = Session({"MAASTART", Special(MAA_FILE_TRANS_H2T, 10) + "abcd"}, 0, [&] {
+        early = Str(vdev::HostReadAtLeast(vdev::kPrn, 12, 5000));
+        vdev::ExpirePoll(vdev::kPrn, 1);
+        WaitUntil([] { return vdev::ExpiredPolls(vdev::kPrn) == 1; }, 5000);
+        const U32 address = early.size() >= 12 ? ReadBE32(reinterpret_cast<const U8 *>(early.data() + 8)) : 0;
+        vdev::HostWrite(vdev::kPrn, PeekLine(address, 10) + "MAA-STOP\r");
+    });
+    EXPECT_EQ(o.ret, 0);
+    EXPECT_EQ(o.wire, Frame(1, 1, S("abcd\0\0\0\0\0\0")) + kAck);
+    EXPECT_EQ(LoggerHost_Count("\r\n[MAA:MAA_ReadFile] Invalid DM Read Return(0)"), 1);
 }
 
 // Factory scripts download several files, then pass each address on: every
