@@ -36,8 +36,11 @@ bool Printable(const std::string &s) {
 std::string Text(const std::string &data) {
     if (!Printable(data)) {
         const size_t shown = data.size() < 32 ? data.size() : 32;
-        return "<" + std::to_string(data.size()) + " bytes> " + Hex(data.substr(0, shown)) +
-               (shown < data.size() ? " ..." : "");
+        std::string t = "<";
+        t += std::to_string(data.size());
+        t += " bytes> " + Hex(data.substr(0, shown));
+        if (shown < data.size()) t += " ...";
+        return t;
     }
     std::string t = data;
     while (!t.empty() && (t.back() == '\r' || t.back() == '\n')) t.pop_back();
