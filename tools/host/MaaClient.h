@@ -48,6 +48,8 @@ struct Frame {
     uint32_t status = 0;  // Result: continue flag; Transfer: operation code
     uint32_t result = 0;
     std::string data;     // record data or file contents
+
+    bool operator==(const Frame &) const = default;
 };
 
 // One readable line: "| text", "= result N: text", "<file N bytes>", ...
