@@ -101,9 +101,13 @@ std::string Describe(const Frame &f) {
         if (f.status == kEnd) return "= result " + std::to_string(f.result) + (f.data.empty() ? "" : ": " + Text(f.data));
         return "? record " + std::to_string(f.status) + " result " + std::to_string(f.result) +
                (f.data.empty() ? "" : ": " + Text(f.data));
-    case Frame::Kind::File: return "<file, " + std::to_string(f.data.size()) + " bytes>";
+    case Frame::Kind::File:
+        if (f.headerOnly) return "<file header without data, after the end of files>";
+        return "<file, " + std::to_string(f.data.size()) + " bytes>";
     case Frame::Kind::FileEnd: return "<end of files>";
     case Frame::Kind::Transfer:
+        if (f.headerOnly)
+            return "<transfer " + std::to_string(f.status) + " header without data, after the end of files>";
         return "<transfer " + std::to_string(f.status) + ", " + std::to_string(f.data.size()) + " bytes>";
     }
     return {};
@@ -145,10 +149,21 @@ int Session::ReadFrame(Frame *f, int waitMs) {
         const uint8_t op = static_cast<uint8_t>(header[3]);
         f->status = op;
         f->kind = op == kOpFileEnd ? Frame::Kind::FileEnd : op == kOpT2H ? Frame::Kind::File : Frame::Kind::Transfer;
-        if (op == kOpFileEnd) size = 0;
+        // A forwarded buffer's transfer frames carry no data from its end of
+        // files on. Where that buffer ends does not show on the wire; a record
+        // that ends a statement does, and the next statement's files come with
+        // their data. So the state holds from an end of files to the next
+        // final record. (Transfer frames a forwarded buffer had behind its own
+        // final record could not be told from a new statement's files.)
+        if (op == kOpFileEnd) filesEnded_ = true;
+        if (filesEnded_) {
+            f->headerOnly = op != kOpFileEnd;
+            size = 0;
+        }
     } else {
         f->status = Word(header, 0);
         f->result = Word(header, 4);
+        if (f->status != kContinue) filesEnded_ = false;
     }
     if (!ReadExact(&f->data, size, timeoutMs_))
         return Fail("frame of " + std::to_string(size) + " bytes cut off after " + std::to_string(rx_.size())), -1;

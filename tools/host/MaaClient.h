@@ -5,7 +5,8 @@
 // Wire format (device to host): result records are a 12-byte header of three
 // big-endian words (continue flag, result code, data size) and the data;
 // transfer frames are "#$%", an operation code (1 file, 0xA0 end of files)
-// and the size twice, then the file's bytes.
+// and the size twice, then the file's bytes. In a buffer the device forwards,
+// transfer frames behind the end of files come without their bytes.
 #pragma once
 
 #include <sys/types.h>
@@ -48,6 +49,7 @@ struct Frame {
     uint32_t status = 0;  // Result: continue flag; Transfer: operation code
     uint32_t result = 0;
     std::string data;     // record data or file contents
+    bool headerOnly = false;  // a transfer frame whose size announced bytes that were not sent
 
     bool operator==(const Frame &) const = default;
 };
@@ -97,6 +99,7 @@ private:
     Channel &ch_;
     int timeoutMs_;
     std::string rx_;  // received, not yet decoded
+    bool filesEnded_ = false;  // transfer frames come without data (see ReadFrame)
     std::string error_;
 };
 

@@ -94,7 +94,7 @@ public:
 
     void Print(const maahost::Frame &f) {
         std::string text = maahost::Describe(f);
-        if (f.kind == maahost::Frame::Kind::File) {
+        if (f.kind == maahost::Frame::Kind::File && !f.headerOnly) {
             char name[32];
             std::snprintf(name, sizeof name, "upload-%03d.bin", ++uploads_);
             const std::string path = o_.saveDir + "/" + name;

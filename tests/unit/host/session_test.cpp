@@ -15,7 +15,11 @@
 #include <vector>
 
 #include "MaaClient.h"
+#include "adapter/USB.h"
 #include "common/ByteOrder.h"
+#include "maa/MAA_IF.h"
+#include "maa/MAA_Result.h"
+#include "vendor/VLX_Main.h"
 
 namespace maahost {
 
@@ -40,9 +44,13 @@ std::string BE32(uint32_t v) {
 std::string Record(uint32_t cont, uint32_t result, const std::string &data) {
     return BE32(cont) + BE32(result) + BE32(static_cast<uint32_t>(data.size())) + data;
 }
-std::string Transfer(uint8_t op, uint32_t size) { return std::string("#$%") + static_cast<char>(op) + BE32(size) + BE32(size); }
+std::string Transfer(uint8_t op, uint32_t size) {
+    return std::string("#$%") + static_cast<char>(op) + BE32(size) + BE32(size);
+}
 // Host to device.
-std::string Special(uint8_t op, uint32_t size) { return std::string("#$%") + static_cast<char>(op) + BE32(size) + "\r"; }
+std::string Special(uint8_t op, uint32_t size) {
+    return std::string("#$%") + static_cast<char>(op) + BE32(size) + "\r";
+}
 
 std::string Pattern(size_t n) {
     std::string s(n, '\0');
@@ -50,9 +58,15 @@ std::string Pattern(size_t n) {
     return s;
 }
 
-Frame Result(uint32_t cont, uint32_t result, const std::string &data) { return {Frame::Kind::Result, cont, result, data}; }
+Frame Result(uint32_t cont, uint32_t result, const std::string &data) {
+    return {Frame::Kind::Result, cont, result, data};
+}
 Frame File(const std::string &data) { return {Frame::Kind::File, kOpT2H, 0, data}; }
 Frame FileEnd() { return {Frame::Kind::FileEnd, kOpFileEnd, 0, ""}; }
+// A transfer frame the device sent without its data.
+Frame HeaderOnly(uint8_t op) {
+    return {op == kOpT2H ? Frame::Kind::File : Frame::Kind::Transfer, op, 0, "", true};
+}
 
 bool SendAll(int fd, const std::string &bytes) {
     for (size_t at = 0; at < bytes.size();) {
@@ -200,6 +214,66 @@ TEST_F(ClientTest, FramesComeOutAsTheDeviceSentThem) {
     }
 }
 
+// A forwarded buffer: from its end of files on, transfer frames are 12 bytes
+// only, whatever their size says; records keep their data.
+TEST_F(ClientTest, TransferFramesAfterTheEndOfFilesCarryNoData) {
+    struct Row {
+        const char *name;
+        std::string device;
+        std::vector<Frame> frames;
+    } rows[] = {
+        {"forwarded buffer",
+         Record(0, 1, "abc") + Transfer(kOpT2H, 5) + Pattern(5) + Transfer(kOpFileEnd, 0) + Transfer(kOpT2H, 5) +
+             Transfer(kOpT2H, 0x10000) + Record(0, 0, "more") + Transfer(kOpAutoEnd, 3) + Transfer(kOpFileEnd, 9) +
+             Record(1, 1, "done"),
+         {Result(0, 1, "abc"), File(Pattern(5)), FileEnd(), HeaderOnly(kOpT2H), HeaderOnly(kOpT2H),
+          Result(0, 0, "more"), HeaderOnly(kOpAutoEnd), FileEnd(), Result(1, 1, "done")}},
+        {"next statement's files after the final record",
+         Transfer(kOpFileEnd, 0) + Transfer(kOpT2H, 4) + Record(1, 1, "") + Transfer(kOpT2H, 4) + "data" +
+             Transfer(kOpFileEnd, 0) + Transfer(kOpT2H, 4) + Record(2, 0, "") + Transfer(kOpT2H, 2) + "xy",
+         {FileEnd(), HeaderOnly(kOpT2H), Result(1, 1, ""), File("data"), FileEnd(), HeaderOnly(kOpT2H),
+          Result(2, 0, ""), File("xy")}},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.name);
+        Reconnect();
+        Session s(*channel, kTimeoutMs);
+        DeviceSends(r.device);
+        int status = 0;
+        EXPECT_EQ(Frames(s, &status), r.frames);
+        EXPECT_EQ(status, static_cast<int>(r.frames.size())) << s.Error();
+    }
+}
+
+// The library's own result writers on the device's end: a forwarded buffer
+// with a file after its end of files, then a statement sending a file.
+TEST_F(ClientTest, DecodesWhatTheDeviceWrites) {
+    std::string file = Pattern(5000), second = Pattern(300);
+    std::string forwarded = Record(0, 1, "abc") + Transfer(kOpT2H, 5000) + file + Transfer(kOpFileEnd, 0) +
+                            Transfer(kOpT2H, 5) + Record(0, 0, "ok");
+    IsDisconnected = 0;
+    enSpecialMode = MAA_NORMAL_CMD;
+    ulDrvHandle = static_cast<U32>(sp[1]);
+    Device([&](int) {
+        TMAAResult r{MAA_RESULT_CONTINUE, 0, static_cast<U32>(forwarded.size()),
+                     reinterpret_cast<U8 *>(forwarded.data())};
+        MAA_WriteResultForward(&r);
+        r = {MAA_RESULT_END, 1, 0, nullptr};
+        MAA_WriteResultFrame(&r);
+        MAA_WriteFile(reinterpret_cast<const U8 *>(second.data()), static_cast<U32>(second.size()));
+        MAA_FileEnd();
+        MAA_WriteResultFrame(&r);
+    });
+    Session s(*channel, kTimeoutMs);
+    int status = 0;
+    std::vector<Frame> frames = Frames(s, &status);
+    device.join();
+    EXPECT_EQ(frames, (std::vector<Frame>{Result(0, 1, "abc"), File(file), FileEnd(), HeaderOnly(kOpT2H),
+                                                      Result(0, 0, "ok"), Result(1, 1, ""), File(second), FileEnd(),
+                                                      Result(1, 1, "")}));
+    EXPECT_EQ(status, 9) << s.Error();
+}
+
 TEST_F(ClientTest, CutFramesAreErrorsAfterTheWholeOnes) {
     struct Row {
         const char *name;
@@ -271,6 +345,8 @@ TEST(Describe, OneLinePerFrame) {
         {File(Pattern(12)), "<file, 12 bytes>"},
         {FileEnd(), "<end of files>"},
         {Frame{Frame::Kind::Transfer, 5, 0, "abc"}, "<transfer 5, 3 bytes>"},
+        {HeaderOnly(kOpT2H), "<file header without data, after the end of files>"},
+        {HeaderOnly(5), "<transfer 5 header without data, after the end of files>"},
     };
     for (const Row &r : rows) EXPECT_EQ(Describe(r.frame), r.line);
 }
