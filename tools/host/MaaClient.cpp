@@ -5,6 +5,7 @@
 
 #include <cerrno>
 #include <chrono>
+#include <cstdint>
 #include <cstdio>
 
 #include "common/ByteOrder.h"
@@ -81,6 +82,12 @@ ssize_t FdChannel::Receive(void *data, size_t size, int timeoutMs) {
         // A printer class device may be readable with nothing to give yet.
         if (n > 0 || NowMs() >= deadline) return n;
     }
+}
+
+std::string CheckDownloadSize(uint64_t size) {
+    if (size <= UINT32_MAX) return {};
+    return std::to_string(size) + " bytes cannot be downloaded: the size field has 32 bits (at most " +
+           std::to_string(UINT32_MAX) + " bytes, under 4 GiB)";
 }
 
 std::string Hex(const std::string &bytes) {
@@ -222,6 +229,10 @@ int Session::Command(const std::string &line, const std::function<void(const Fra
 }
 
 std::optional<uint32_t> Session::Download(const std::string &bytes) {
+    if (std::string refused = CheckDownloadSize(bytes.size()); !refused.empty()) {
+        Fail(refused);
+        return std::nullopt;
+    }
     const std::string command = Special(kOpH2T, static_cast<uint32_t>(bytes.size()));
     if (!ch_.Send(command.data(), command.size()) || !ch_.Send(bytes.data(), bytes.size())) {
         Fail("sending the file failed");

@@ -54,6 +54,10 @@ struct Frame {
     bool operator==(const Frame &) const = default;
 };
 
+// Empty when a download of `size` bytes can be sent, else why not: its size
+// travels in a 32-bit field.
+std::string CheckDownloadSize(uint64_t size);
+
 // One readable line: "| text", "= result N: text", "<file N bytes>", ...
 std::string Describe(const Frame &frame);
 // Hex of bytes, "1b 77 4d ...".
@@ -81,6 +85,7 @@ public:
     // Reads frames already on their way (same rules as Command without a line).
     int Collect(const std::function<void(const Frame &)> &onFrame, int quietMs, int lingerMs = 100);
     // Downloads bytes into a device buffer; its address for test functions.
+    // Nothing is sent when CheckDownloadSize refuses the size.
     std::optional<uint32_t> Download(const std::string &bytes);
     // Special command without data: auto or JIG mode start (with the size of
     // the device's saved-command buffer) and end.

@@ -9,6 +9,7 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
 #include <iostream>
 #include <sstream>
@@ -30,7 +31,8 @@ const char kUsage[] =
     "  -e, --exec LINE     send one command line (repeatable; in order with -s, -p)\n"
     "  -s, --script FILE   send the lines of FILE ('-': standard input)\n"
     "  -p, --put FILE      download FILE into a device buffer (same as the line\n"
-    "                      \"!put FILE\"); later lines may use its address as $addr\n"
+    "                      \"!put FILE\"); later lines may use its address as $addr;\n"
+    "                      a file of 4 GiB or more is refused (32-bit size field)\n"
     "      --auto          an auto session: the device saves the lines and runs\n"
     "                      them after the stop, answering nothing\n"
     "  -o, --save DIR      directory for files the device sends (default .)\n"
@@ -116,10 +118,21 @@ public:
         return n >= 0;
     }
 
+    // A file's size is checked before it is read: a refused one need not fit in memory.
     bool Put(const std::string &path) {
+        std::error_code ec;
+        const uintmax_t onDisk = std::filesystem::file_size(path, ec);
+        std::string refused = ec ? "" : maahost::CheckDownloadSize(onDisk);
         std::string bytes;
-        if (!ReadAll(path, &bytes)) {
-            std::cerr << "usbadapter-shell: cannot read " << path << "\n";
+        if (refused.empty()) {
+            if (!ReadAll(path, &bytes)) {
+                std::cerr << "usbadapter-shell: cannot read " << path << "\n";
+                return true;
+            }
+            refused = maahost::CheckDownloadSize(bytes.size());
+        }
+        if (!refused.empty()) {
+            std::cerr << "usbadapter-shell: " << path << " not put: " << refused << "\n";
             return true;
         }
         std::optional<uint32_t> a = s_.Download(bytes);
