@@ -90,6 +90,12 @@ std::string CheckDownloadSize(uint64_t size) {
            std::to_string(UINT32_MAX) + " bytes, under 4 GiB)";
 }
 
+size_t DropBlankLines(std::vector<std::string> *lines) {
+    const size_t before = lines->size();
+    std::erase_if(*lines, [](const std::string &l) { return l.find_first_not_of(" \t") == std::string::npos; });
+    return before - lines->size();
+}
+
 std::string Hex(const std::string &bytes) {
     std::string out;
     char b[4];

@@ -15,6 +15,7 @@
 #include <functional>
 #include <optional>
 #include <string>
+#include <vector>
 
 namespace maahost {
 
@@ -57,6 +58,11 @@ struct Frame {
 // Empty when a download of `size` bytes can be sent, else why not: its size
 // travels in a 32-bit field.
 std::string CheckDownloadSize(uint64_t size);
+
+// The device runs an auto session's saved lines up to the first empty one, so
+// blank lines (empty or only blanks and tabs) are removed from an auto script;
+// returns how many.
+size_t DropBlankLines(std::vector<std::string> *lines);
 
 // One readable line: "| text", "= result N: text", "<file N bytes>", ...
 std::string Describe(const Frame &frame);

@@ -34,7 +34,9 @@ const char kUsage[] =
     "                      \"!put FILE\"); later lines may use its address as $addr;\n"
     "                      a file of 4 GiB or more is refused (32-bit size field)\n"
     "      --auto          an auto session: the device saves the lines and runs\n"
-    "                      them after the stop, answering nothing\n"
+    "                      them after the stop, answering nothing; its run ends\n"
+    "                      at an empty line, so blank lines are dropped (a note\n"
+    "                      on standard error says how many)\n"
     "  -o, --save DIR      directory for files the device sends (default .)\n"
     "  -w, --wait MS       silence that ends the output of a line (default 2000)\n"
     "  -t, --timeout MS    bound of every answer the device owes (default 5000)\n"
@@ -149,7 +151,10 @@ public:
 
     // Auto session: the lines go into the device's buffer and run after the
     // stop. Each line takes its length + 2 bytes there, an address 10.
-    bool Auto(const std::vector<std::string> &lines) {
+    bool Auto(std::vector<std::string> lines) {
+        if (size_t dropped = maahost::DropBlankLines(&lines))
+            std::cerr << "usbadapter-shell: " << dropped << " blank line" << (dropped == 1 ? "" : "s")
+                      << " dropped from the auto script (the device's auto run would stop there)\n";
         size_t size = 1;
         for (const std::string &l : lines) size += Substitute(l, "0x00000000").size() + 2;
         if (!s_.SendSpecial(maahost::kOpAutoStart, static_cast<uint32_t>(size))) return false;

@@ -3,6 +3,7 @@
 
 #include <cstdint>
 #include <string>
+#include <vector>
 
 #include "MaaClient.h"
 
@@ -30,6 +31,28 @@ TEST(CheckDownloadSize, RefusesWhatTheSizeFieldCannotHold) {
             EXPECT_EQ(why.rfind(std::to_string(r.size) + " bytes cannot be downloaded", 0), 0u) << why;
             EXPECT_NE(why.find("4 GiB"), std::string::npos) << why;
         }
+    }
+}
+
+TEST(DropBlankLines, KeepsEveryLineTheAutoRunShouldReach) {
+    using Lines = std::vector<std::string>;
+    struct Row {
+        const char *name;
+        Lines script;
+        Lines kept;
+    } rows[] = {
+        {"none blank", {"a=1", "probe(7)"}, {"a=1", "probe(7)"}},
+        {"empty lines anywhere", {"", "a=1", "", "", "probe(7)", ""}, {"a=1", "probe(7)"}},
+        {"spaces and tabs only", {" ", "\t \t", "a=1"}, {"a=1"}},
+        {"blanks around a statement stay", {" a=1\t", "!put x.bin", "f($addr)"}, {" a=1\t", "!put x.bin", "f($addr)"}},
+        {"all blank", {"", " "}, {}},
+        {"empty script", {}, {}},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.name);
+        Lines lines = r.script;
+        EXPECT_EQ(DropBlankLines(&lines), r.script.size() - r.kept.size());
+        EXPECT_EQ(lines, r.kept);
     }
 }
 
