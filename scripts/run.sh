@@ -1,12 +1,13 @@
 #!/usr/bin/env bash
-# Builds the library and the simulator, then plays a host session: the library
-# inside a JVM with the reference print service, on virtual devices.
+# Builds the library, the simulator and the host tool usbadapter-shell, then
+# plays a host session: the library inside a JVM with the reference print
+# service, on virtual devices.
 #   scripts/run.sh                 the sample session (tools/sim/samples/session.sim)
 #   scripts/run.sh ARGS...         usbadapter-sim with these arguments (files, -s, -e, ...)
 set -euo pipefail
 cd "$(dirname "$0")/.."
 cmake --preset default >/dev/null
-cmake --build --preset default --target usbadapter usbadapter-sim >/dev/null
+cmake --build --preset default --target usbadapter usbadapter-sim usbadapter-shell >/dev/null
 echo "== exported entries of libusbadapter.so"
 nm -D --defined-only build/default/src/libusbadapter.so | awk '{print "  " $3}'
 out=build/default/sim-out

@@ -1,8 +1,9 @@
 #!/usr/bin/env bash
 # The whole test suite: installs what is missing, builds and tests the host build
-# (with the JVM tests), the controller ABI under qemu-arm, and the sanitizer builds.
+# (with the JVM tests), the controller ABI under qemu-arm, the sanitizer builds,
+# and a packager's plain Release build.
 #   scripts/test.sh            everything
-#   scripts/test.sh host       one stage: host | armhf | asan | tsan | fuzz
+#   scripts/test.sh host       one stage: host | armhf | asan | tsan | fuzz | release
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
@@ -20,7 +21,7 @@ if ((${#missing[@]})); then
 fi
 
 stages=("$@")
-((${#stages[@]})) || stages=(host armhf asan tsan fuzz)
+((${#stages[@]})) || stages=(host armhf asan tsan fuzz release)
 
 run_preset() {
   local preset=$1
@@ -52,6 +53,18 @@ for stage in "${stages[@]}"; do
         grep -E '^(#[0-9]+ +DONE|Done [0-9]+ runs|==[0-9]+==|SUMMARY)' "build/fuzz/$t.log" || true
         if [ "$rc" -ne 0 ]; then tail -n 40 "build/fuzz/$t.log"; exit "$rc"; fi
       done
+      ;;
+    release)
+      # No preset, as a packager configures: warnings do not stop that build, so
+      # the stage fails on any, from a clean tree (else unchanged files stay silent).
+      echo "== release: plain Release configure and build"
+      rm -rf build/release
+      cmake -S . -B build/release -G Ninja -DCMAKE_BUILD_TYPE=Release >/dev/null
+      cmake --build build/release -j2 2>&1 | tee build/release/build.log
+      if grep -q 'warning:' build/release/build.log; then
+        echo "release: the build printed warnings (build/release/build.log)" >&2
+        exit 1
+      fi
       ;;
     *) echo "unknown stage: $stage" >&2; exit 2 ;;
   esac

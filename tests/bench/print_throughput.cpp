@@ -199,7 +199,9 @@ int main(int argc, char **argv) {
             ->Unit(benchmark::kMillisecond);
         benchmark::RegisterBenchmark("BM_PrintPath", BM_PrintPath)->Arg(size)->UseManualTime()->MinTime(1.0)
             ->Unit(benchmark::kMillisecond);
-        const std::string suffix = "/" + std::to_string(size) + "/min_time:1.000/manual_time";
+        std::string suffix = "/";
+        suffix += std::to_string(size);
+        suffix += "/min_time:1.000/manual_time";
         reporter.Compare("BM_PrintPath" + suffix, "BM_BareChannel" + suffix);
     }
     benchmark::RunSpecifiedBenchmarks(&reporter);

@@ -46,5 +46,32 @@ printf '%s\n' "| HIGH" "= result 1: File Read Complete : /halvard/sys/statusinfo
 cmp -s "$dir/tool.txt" "$dir/want.txt" || fail "usbadapter-shell printed something else"
 grep -q '"event":"pty-end","to-device":' "$dir/out2/session.jsonl" || fail "no pty-end in the journal"
 
+# An auto session with blank lines: the tool drops them (the device's run would
+# end at the first) and says so; both dumps run after the stop, silently, as the
+# library's log shows.
+printf '%s\n' 'Dump_File("/halvard/sys/statusinfo/usb_speed.txt")' '' ' ' \
+    'Dump_File("/halvard/sys/statusinfo/usb_speed.txt")' >"$dir/auto.txt"
+USBADAPTER_LOG_LEVEL=INFO "$sim" --out "$dir/out3" --timeout 8000 -e "pty prn $dir/prn" -e "expect-jobs 0" \
+    >"$dir/sim3.txt" 2>&1 &
+pid=$!
+i=0
+while [ ! -L "$dir/prn" ]; do
+    i=$((i + 1))
+    [ $i -lt 400 ] || fail "the simulator made no pseudo-terminal (auto session)"
+    sleep 0.05
+done
+"$tool" --auto -s "$dir/auto.txt" "$dir/prn" >"$dir/auto-out.txt" 2>"$dir/auto-err.txt"
+status=$?
+wait $pid
+simStatus=$?
+cat "$dir/auto-out.txt" "$dir/auto-err.txt" "$dir/sim3.txt"
+[ $status -eq 0 ] || fail "usbadapter-shell --auto: exit status $status"
+[ $simStatus -eq 0 ] || fail "simulator with the auto session: exit status $simStatus"
+[ ! -s "$dir/auto-out.txt" ] || fail "usbadapter-shell --auto printed records"
+grep -qx "usbadapter-shell: 2 blank lines dropped from the auto script (the device's auto run would stop there)" \
+    "$dir/auto-err.txt" || fail "no note of the dropped blank lines"
+dumps=$(grep -c "File Dump Start" "$dir/out3/usbadapter.log")
+[ "$dumps" -eq 2 ] || fail "the auto run dumped $dumps times, not 2"
+
 rm -rf "$dir"
 echo "PASS"

@@ -5,6 +5,7 @@
 
 #include <cerrno>
 #include <chrono>
+#include <cstdint>
 #include <cstdio>
 
 #include "common/ByteOrder.h"
@@ -36,8 +37,11 @@ bool Printable(const std::string &s) {
 std::string Text(const std::string &data) {
     if (!Printable(data)) {
         const size_t shown = data.size() < 32 ? data.size() : 32;
-        return "<" + std::to_string(data.size()) + " bytes> " + Hex(data.substr(0, shown)) +
-               (shown < data.size() ? " ..." : "");
+        std::string t = "<";
+        t += std::to_string(data.size());
+        t += " bytes> " + Hex(data.substr(0, shown));
+        if (shown < data.size()) t += " ...";
+        return t;
     }
     std::string t = data;
     while (!t.empty() && (t.back() == '\r' || t.back() == '\n')) t.pop_back();
@@ -80,6 +84,18 @@ ssize_t FdChannel::Receive(void *data, size_t size, int timeoutMs) {
     }
 }
 
+std::string CheckDownloadSize(uint64_t size) {
+    if (size <= UINT32_MAX) return {};
+    return std::to_string(size) + " bytes cannot be downloaded: the size field has 32 bits (at most " +
+           std::to_string(UINT32_MAX) + " bytes, under 4 GiB)";
+}
+
+size_t DropBlankLines(std::vector<std::string> *lines) {
+    const size_t before = lines->size();
+    std::erase_if(*lines, [](const std::string &l) { return l.find_first_not_of(" \t") == std::string::npos; });
+    return before - lines->size();
+}
+
 std::string Hex(const std::string &bytes) {
     std::string out;
     char b[4];
@@ -98,9 +114,13 @@ std::string Describe(const Frame &f) {
         if (f.status == kEnd) return "= result " + std::to_string(f.result) + (f.data.empty() ? "" : ": " + Text(f.data));
         return "? record " + std::to_string(f.status) + " result " + std::to_string(f.result) +
                (f.data.empty() ? "" : ": " + Text(f.data));
-    case Frame::Kind::File: return "<file, " + std::to_string(f.data.size()) + " bytes>";
+    case Frame::Kind::File:
+        if (f.headerOnly) return "<file header without data, after the end of files>";
+        return "<file, " + std::to_string(f.data.size()) + " bytes>";
     case Frame::Kind::FileEnd: return "<end of files>";
     case Frame::Kind::Transfer:
+        if (f.headerOnly)
+            return "<transfer " + std::to_string(f.status) + " header without data, after the end of files>";
         return "<transfer " + std::to_string(f.status) + ", " + std::to_string(f.data.size()) + " bytes>";
     }
     return {};
@@ -142,10 +162,21 @@ int Session::ReadFrame(Frame *f, int waitMs) {
         const uint8_t op = static_cast<uint8_t>(header[3]);
         f->status = op;
         f->kind = op == kOpFileEnd ? Frame::Kind::FileEnd : op == kOpT2H ? Frame::Kind::File : Frame::Kind::Transfer;
-        if (op == kOpFileEnd) size = 0;
+        // A forwarded buffer's transfer frames carry no data from its end of
+        // files on. Where that buffer ends does not show on the wire; a record
+        // that ends a statement does, and the next statement's files come with
+        // their data. So the state holds from an end of files to the next
+        // final record. (Transfer frames a forwarded buffer had behind its own
+        // final record could not be told from a new statement's files.)
+        if (op == kOpFileEnd) filesEnded_ = true;
+        if (filesEnded_) {
+            f->headerOnly = op != kOpFileEnd;
+            size = 0;
+        }
     } else {
         f->status = Word(header, 0);
         f->result = Word(header, 4);
+        if (f->status != kContinue) filesEnded_ = false;
     }
     if (!ReadExact(&f->data, size, timeoutMs_))
         return Fail("frame of " + std::to_string(size) + " bytes cut off after " + std::to_string(rx_.size())), -1;
@@ -204,6 +235,10 @@ int Session::Command(const std::string &line, const std::function<void(const Fra
 }
 
 std::optional<uint32_t> Session::Download(const std::string &bytes) {
+    if (std::string refused = CheckDownloadSize(bytes.size()); !refused.empty()) {
+        Fail(refused);
+        return std::nullopt;
+    }
     const std::string command = Special(kOpH2T, static_cast<uint32_t>(bytes.size()));
     if (!ch_.Send(command.data(), command.size()) || !ch_.Send(bytes.data(), bytes.size())) {
         Fail("sending the file failed");

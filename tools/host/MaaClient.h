@@ -5,7 +5,8 @@
 // Wire format (device to host): result records are a 12-byte header of three
 // big-endian words (continue flag, result code, data size) and the data;
 // transfer frames are "#$%", an operation code (1 file, 0xA0 end of files)
-// and the size twice, then the file's bytes.
+// and the size twice, then the file's bytes. In a buffer the device forwards,
+// transfer frames behind the end of files come without their bytes.
 #pragma once
 
 #include <sys/types.h>
@@ -14,6 +15,7 @@
 #include <functional>
 #include <optional>
 #include <string>
+#include <vector>
 
 namespace maahost {
 
@@ -48,7 +50,19 @@ struct Frame {
     uint32_t status = 0;  // Result: continue flag; Transfer: operation code
     uint32_t result = 0;
     std::string data;     // record data or file contents
+    bool headerOnly = false;  // a transfer frame whose size announced bytes that were not sent
+
+    bool operator==(const Frame &) const = default;
 };
+
+// Empty when a download of `size` bytes can be sent, else why not: its size
+// travels in a 32-bit field.
+std::string CheckDownloadSize(uint64_t size);
+
+// The device runs an auto session's saved lines up to the first empty one, so
+// blank lines (empty or only blanks and tabs) are removed from an auto script;
+// returns how many.
+size_t DropBlankLines(std::vector<std::string> *lines);
 
 // One readable line: "| text", "= result N: text", "<file N bytes>", ...
 std::string Describe(const Frame &frame);
@@ -77,6 +91,7 @@ public:
     // Reads frames already on their way (same rules as Command without a line).
     int Collect(const std::function<void(const Frame &)> &onFrame, int quietMs, int lingerMs = 100);
     // Downloads bytes into a device buffer; its address for test functions.
+    // Nothing is sent when CheckDownloadSize refuses the size.
     std::optional<uint32_t> Download(const std::string &bytes);
     // Special command without data: auto or JIG mode start (with the size of
     // the device's saved-command buffer) and end.
@@ -95,6 +110,7 @@ private:
     Channel &ch_;
     int timeoutMs_;
     std::string rx_;  // received, not yet decoded
+    bool filesEnded_ = false;  // transfer frames come without data (see ReadFrame)
     std::string error_;
 };
 

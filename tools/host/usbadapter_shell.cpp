@@ -9,6 +9,7 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
 #include <iostream>
 #include <sstream>
@@ -30,9 +31,12 @@ const char kUsage[] =
     "  -e, --exec LINE     send one command line (repeatable; in order with -s, -p)\n"
     "  -s, --script FILE   send the lines of FILE ('-': standard input)\n"
     "  -p, --put FILE      download FILE into a device buffer (same as the line\n"
-    "                      \"!put FILE\"); later lines may use its address as $addr\n"
+    "                      \"!put FILE\"); later lines may use its address as $addr;\n"
+    "                      a file of 4 GiB or more is refused (32-bit size field)\n"
     "      --auto          an auto session: the device saves the lines and runs\n"
-    "                      them after the stop, answering nothing\n"
+    "                      them after the stop, answering nothing; its run ends\n"
+    "                      at an empty line, so blank lines are dropped (a note\n"
+    "                      on standard error says how many)\n"
     "  -o, --save DIR      directory for files the device sends (default .)\n"
     "  -w, --wait MS       silence that ends the output of a line (default 2000)\n"
     "  -t, --timeout MS    bound of every answer the device owes (default 5000)\n"
@@ -94,7 +98,7 @@ public:
 
     void Print(const maahost::Frame &f) {
         std::string text = maahost::Describe(f);
-        if (f.kind == maahost::Frame::Kind::File) {
+        if (f.kind == maahost::Frame::Kind::File && !f.headerOnly) {
             char name[32];
             std::snprintf(name, sizeof name, "upload-%03d.bin", ++uploads_);
             const std::string path = o_.saveDir + "/" + name;
@@ -116,10 +120,21 @@ public:
         return n >= 0;
     }
 
+    // A file's size is checked before it is read: a refused one need not fit in memory.
     bool Put(const std::string &path) {
+        std::error_code ec;
+        const uintmax_t onDisk = std::filesystem::file_size(path, ec);
+        std::string refused = ec ? "" : maahost::CheckDownloadSize(onDisk);
         std::string bytes;
-        if (!ReadAll(path, &bytes)) {
-            std::cerr << "usbadapter-shell: cannot read " << path << "\n";
+        if (refused.empty()) {
+            if (!ReadAll(path, &bytes)) {
+                std::cerr << "usbadapter-shell: cannot read " << path << "\n";
+                return true;
+            }
+            refused = maahost::CheckDownloadSize(bytes.size());
+        }
+        if (!refused.empty()) {
+            std::cerr << "usbadapter-shell: " << path << " not put: " << refused << "\n";
             return true;
         }
         std::optional<uint32_t> a = s_.Download(bytes);
@@ -136,7 +151,10 @@ public:
 
     // Auto session: the lines go into the device's buffer and run after the
     // stop. Each line takes its length + 2 bytes there, an address 10.
-    bool Auto(const std::vector<std::string> &lines) {
+    bool Auto(std::vector<std::string> lines) {
+        if (size_t dropped = maahost::DropBlankLines(&lines))
+            std::cerr << "usbadapter-shell: " << dropped << " blank line" << (dropped == 1 ? "" : "s")
+                      << " dropped from the auto script (the device's auto run would stop there)\n";
         size_t size = 1;
         for (const std::string &l : lines) size += Substitute(l, "0x00000000").size() + 2;
         if (!s_.SendSpecial(maahost::kOpAutoStart, static_cast<uint32_t>(size))) return false;

@@ -318,7 +318,10 @@ bool Send(Session &s, const Args &a, std::string *error) {
                                                                                 static_cast<long long>(sizes.size()));
     if (sizes.size() <= 64) {
         std::string list = "[";
-        for (size_t i = 0; i < sizes.size(); ++i) list += (i ? "," : "") + std::to_string(sizes[i]);
+        for (size_t i = 0; i < sizes.size(); ++i) {
+            if (i) list += ',';
+            list += std::to_string(sizes[i]);
+        }
         line.Raw("sizes", list + "]");
     }
     s.Host(line.Str("sha256", Sha256Hex(bytes)));
