@@ -353,15 +353,11 @@ void USBAdapter_ReadPass(void) {
     S32 firmRes = 0;
     TUSBAdp_ParserID enParserID = enOther;
     bool readMore = false;
-    if (startUELFlag == 1) {
-        // The last chunk ended inside a UEL: what comes next is its rest, not a
-        // new stream for the classifier. Read it at once, so a closing UEL cut
-        // after its 7th or 8th byte ends the job without waiting for silence.
-        short revents = 0;
-        if (pollPrn(slPollTimeout, &revents) < 1) {
-            if (!shouldPark()) onSilence(d);
-            return;
-        }
+    // The last chunk ended inside a UEL: what comes next is its rest, not a new
+    // stream for the classifier. It is read at once, so a closing UEL cut after
+    // its 7th or 8th byte ends the job without waiting for silence.
+    const bool heldUel = startUELFlag == 1;
+    if (heldUel) {
         readMore = true;
     } else if (S32 got = USBAdapter_ReadDataClassifier(aubcommand); got == -1) {
         // Parking ends an open job on the way out, not as a silence.
@@ -396,8 +392,10 @@ void USBAdapter_ReadPass(void) {
     S32 prn_read_ret = 0;
     if (readMore) {
         USBADP_LOG(DEBUG, "[USBAdp] PollTimeout -- 2: %d\n", slPollTimeout);
+        const int64_t start = Wait_NowMs();
+        const S32 period = slPollTimeout;
         short revents = 0;
-        int slRet = pollPrn(slPollTimeout, &revents);
+        int slRet = pollPrn(period, &revents);
         USBADP_LOG(DEBUG, "[USBAdp] slRet from poll: %d\n", slRet);
         if (revents) USBADP_LOG(DEBUG, "[USBAdp]n revents in fd[0]: %d\n", revents);
         if (slRet > 0) {
@@ -408,6 +406,17 @@ void USBAdapter_ReadPass(void) {
             } else if (n < 0) {
                 USBADP_LOG(ERROR, "[USBAdp] Error in read of print data, errno: %d\n", errno);
             }
+        }
+        if (heldUel && prn_read_ret == 0) {
+            // Nothing behind the held bytes: this pass was a silence.
+            if (shouldPark()) return;
+            if (slRet == 0 && slPollTimeout == POLL_TIMEOUT_UEL) {
+                slPollTimeout = POLL_TIMEOUT_IDLE;
+                USBADP_LOG(INFO, "[USBAdp] Print channel poll timeout updated to 5sec\n");
+            }
+            if (slRet != 0) idleRestOfPeriod(start, period);
+            onSilence(d);
+            return;
         }
     } else {
         USBADP_LOG(DEBUG, "[USBAdp] Data less than 80bytes: %d\n", firmRes);

@@ -85,26 +85,51 @@ TEST_F(ReaderSignals, ApplicationHeaderArrivingLateIsNotDropped) {
 }
 
 // A node that says it is ready and then gives nothing (here: hung up). The
-// reader lets each poll period pass instead of asking again at once.
+// reader lets each poll period pass instead of asking again at once, with or
+// without UEL bytes held from the last chunk.
 TEST_F(ReaderSignals, HungUpNodeDoesNotMakeTheReaderSpin) {
-    slPollTimeout = 5000;
-    vdev::Reset();  // the reader's descriptor is dead: ready, and reads give 0
-    std::thread parker([] {
-        std::this_thread::sleep_for(std::chrono::milliseconds(600));
-        IsConfigured = 0;
-    });
-    timespec before, after;
-    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &before);
-    const auto start = Clock::now();
-    for (int passes = 0; IsConfigured && passes < 1000000; ++passes) USBAdapter_ReadPass();
-    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &after);
-    const long wallMs =
-        static_cast<long>(std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - start).count());
-    parker.join();
-    const long cpuMs = (after.tv_sec - before.tv_sec) * 1000 + (after.tv_nsec - before.tv_nsec) / 1000000;
-    EXPECT_GE(wallMs, 500);
-    EXPECT_LT(wallMs, 3000) << "parking is noticed while idling";
-    EXPECT_LT(cpuMs, wallMs / 5) << "the reader spun on a node with nothing to give";
+    const struct {
+        const char *name;
+        std::string before;  // what the host sent before the node hung up
+        size_t jobs;
+    } rows[] = {{"idle", "", 0}, {"held UEL bytes", "page\x1b%-12", 1}};
+    for (const auto &r : rows) {
+        SCOPED_TRACE(r.name);
+        rec::Clear();
+        ResetReader();
+        vdev::Reset();
+        fdPrn = ::open(vdev::kPrn, O_RDWR);
+        IsConfigured = 1;
+        slPollTimeout = 5000;
+        if (!r.before.empty()) {
+            vdev::SetInstantTimeouts(vdev::kPrn, true);
+            Send({r.before}, false);
+        }
+        vdev::Reset();  // the reader's descriptor is dead: ready, and reads give 0
+        std::thread parker([] {
+            std::this_thread::sleep_for(std::chrono::milliseconds(600));
+            IsConfigured = 0;
+        });
+        timespec before, after;
+        clock_gettime(CLOCK_THREAD_CPUTIME_ID, &before);
+        const auto start = Clock::now();
+        for (int passes = 0; IsConfigured && passes < 1000000; ++passes) USBAdapter_ReadPass();
+        clock_gettime(CLOCK_THREAD_CPUTIME_ID, &after);
+        const long wallMs =
+            static_cast<long>(std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - start).count());
+        parker.join();
+        const long cpuMs = (after.tv_sec - before.tv_sec) * 1000 + (after.tv_nsec - before.tv_nsec) / 1000000;
+        EXPECT_GE(wallMs, 500);
+        EXPECT_LT(wallMs, 3000) << "parking is noticed while idling";
+        EXPECT_LT(cpuMs, wallMs / 5) << "the reader spun on a node with nothing to give";
+        USBAdapter_EndJobOnPark();
+        auto jobs = rec::Jobs();
+        ASSERT_EQ(jobs.size(), r.jobs);
+        for (const rec::Job &j : jobs) {
+            EXPECT_EQ(j.bytes, r.before);
+            EXPECT_TRUE(j.ended);
+        }
+    }
 }
 
 }  // namespace
