@@ -44,10 +44,13 @@ U32 DM_ReadDriverInto(U32 ulHandle, U8 *pubDest, U32 ulReadSize, U32 *pulReturnS
     }
     if (count < 1) {
         USBADP_LOG(DEBUG, "\r\n Serial Read Error\\No data");
-        // Ready and yet nothing (hung up, closed, an error, an empty read): the
-        // period is over only when its time is, or the line readers that retry
-        // on a time-out would spin.
-        if (!stopped && r != 0) Wait_Idle(static_cast<int>(period - (Wait_NowMs() - start)), cableGone);
+        // A channel that is hung up, closed or failing is ready again at once
+        // and gives nothing: the period is over only when its time is, or the
+        // line readers that retry on a time-out would spin. (An empty transfer
+        // is a time-out of its own and is gone once read.)
+        const bool broken = (r < 0 && !stopped) || (r > 0 && count < 0 && !stopped) ||
+                            (r > 0 && (revents & (POLLHUP | POLLERR | POLLNVAL)));
+        if (broken) Wait_Idle(static_cast<int>(period - (Wait_NowMs() - start)), cableGone);
         if (!stopped && period == MAA_POLL_TIMEOUT_FIRST) maa_session::slPollTimeout = MAA_POLL_TIMEOUT;
         if (MAA_IsUSBDisconnected()) {
             USBADP_LOG(ERROR, "\r\n[MAA] ReadDriver: USB Disconnected");

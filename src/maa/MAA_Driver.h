@@ -18,8 +18,8 @@ constexpr U32 DM_READ_PIECE_MAX = 4096;
 // Delivers up to min(ulReadSize, DM_READ_PIECE_MAX) bytes (at least one):
 // *pubbufPtr points at them and *pulReturnSize is their count.
 // DM_RET_TIMEOUT when nothing came within the poll time-out (the first wait of
-// the process is five minutes, later ones five seconds); a channel that has
-// nothing to give also takes the whole period. DM_RET_USB_DISCONNECTED once
+// the process is five minutes, later ones five seconds) or an empty transfer
+// came; a channel that is hung up, closed or failing takes the whole period. DM_RET_USB_DISCONNECTED once
 // the cable is gone. A signal is not a time-out: the wait goes on.
 U32 DM_ReadDriver(U32 ulHandle, U8 **pubbufPtr, U32 ulReadSize, U32 *pulReturnSize, TDMCallback ptfDRP);
 // The same into the caller's buffer (room for min(ulReadSize, DM_READ_PIECE_MAX)

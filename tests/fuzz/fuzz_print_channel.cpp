@@ -285,7 +285,7 @@ void cleanUp() {
     stCmdHeap = {};
     MAA_HeapFree(stDataHeap.ulHeapPtr, 0);
     stDataHeap = {};
-    Request_MAA_CommandH2T(0);  // drops the download
+    MAA_DownloadFreeAll();
     MAA_SetResultWriter(nullptr);
     MAA_SymbolClear();
     MAA_AddrReset();
@@ -300,6 +300,7 @@ void setUp() {
     fdPrn = ::open(vdev::kPrn, O_RDWR);
     CHECK(fdPrn > 0, "the print node does not open");
     vdev::SetInstantTimeouts(vdev::kPrn, true);
+    IsConfigured = 1;  // the reader runs its turns only on a configured device
 
     InitializeVars();
     slPollTimeout = POLL_TIMEOUT_IDLE;
