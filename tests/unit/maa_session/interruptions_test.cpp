@@ -1,7 +1,7 @@
 // The session when the channel misbehaves: signals landing in its waits (the
 // bridge's SIGIO reaches whatever thread the kernel picks), a channel that
 // reports readiness and gives nothing, and a cable pulled in the middle of a
-// start command.
+// start command. (The signal cases pin a departure: signals are not time-outs.)
 #include <pthread.h>
 #include <time.h>
 

@@ -1,6 +1,7 @@
 // The reader under the bridge's signals: SIGIO lands on the reader's thread in
 // the middle of its waits. A signal is no time-out, no error and no empty read:
 // nothing changes at the Java side, and silence still ends a job on time.
+// (Pins a departure: signals are not time-outs.)
 // Also: a node that reports readiness but gives nothing must not make the
 // reader spin.
 #include <pthread.h>
