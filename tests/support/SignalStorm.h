@@ -8,7 +8,12 @@
 
 #include <atomic>
 #include <chrono>
+#include <functional>
 #include <thread>
+
+#include <gtest/gtest.h>
+
+#include "support/WaitUntil.h"
 
 class SignalStorm {
 public:
@@ -42,3 +47,24 @@ private:
     std::thread thread_;
     static inline std::atomic<int> delivered_{0};
 };
+
+// Runs `work` on this thread under a storm while `host` plays the host on
+// another. If `work` has not returned `boundMs` after the host is done, the
+// test fails and `rescue` (a cable pull, say) is to make it return.
+inline void UnderSignals(const std::function<void()> &work, const std::function<void()> &host, int boundMs,
+                         const std::function<void()> &rescue) {
+    std::atomic<bool> done{false};
+    std::thread h([&] {
+        host();
+        if (!WaitUntil([&] { return done.load(); }, boundMs)) {
+            ADD_FAILURE() << "still waiting under signals";
+            rescue();
+        }
+    });
+    {
+        SignalStorm storm(pthread_self());
+        work();
+    }
+    done = true;
+    h.join();
+}

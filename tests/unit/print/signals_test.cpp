@@ -5,13 +5,13 @@
 // Also: a node that reports readiness but gives nothing must not make the
 // reader spin.
 #include <pthread.h>
-#include <time.h>
 
 #include <atomic>
 #include <chrono>
 #include <thread>
 
 #include "print/PrintRecorder.h"
+#include "support/CpuTime.h"
 #include "support/SignalStorm.h"
 #include "support/WaitUntil.h"
 
@@ -27,28 +27,13 @@ protected:
         vdev::SetInstantTimeouts(vdev::kPrn, false);
     }
 
-    // Runs `pass` on this thread under a SIGIO storm while `host` plays the
-    // host on another; parks the reader if it is still waiting after 5 s.
+    // Runs `pass` under a SIGIO storm while `host` plays the host; parks the
+    // reader if it is still waiting 5 s later. Returns how long it took.
     static long PassUnderSignals(void (*pass)(), const std::function<void()> &host) {
-        std::atomic<bool> done{false};
-        std::thread h([&] {
-            host();
-            if (!WaitUntil([&] { return done.load(); }, 5000)) {
-                ADD_FAILURE() << "the reader is still waiting";
-                IsConfigured = 0;
-            }
-        });
         const auto start = Clock::now();
-        {
-            SignalStorm storm(pthread_self());
-            pass();
-        }
-        const long ms = static_cast<long>(
-            std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - start).count());
-        done = true;
-        h.join();
+        UnderSignals(pass, host, 5000, [] { IsConfigured = 0; });
         IsConfigured = 1;
-        return ms;
+        return static_cast<long>(std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - start).count());
     }
 };
 
@@ -111,15 +96,13 @@ TEST_F(ReaderSignals, HungUpNodeDoesNotMakeTheReaderSpin) {
             std::this_thread::sleep_for(std::chrono::milliseconds(600));
             IsConfigured = 0;
         });
-        timespec before, after;
-        clock_gettime(CLOCK_THREAD_CPUTIME_ID, &before);
+        const long cpuBefore = ThreadCpuMs();
         const auto start = Clock::now();
         for (int passes = 0; IsConfigured && passes < 1000000; ++passes) USBAdapter_ReadPass();
-        clock_gettime(CLOCK_THREAD_CPUTIME_ID, &after);
+        const long cpuMs = ThreadCpuMs() - cpuBefore;
         const long wallMs =
             static_cast<long>(std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - start).count());
         parker.join();
-        const long cpuMs = (after.tv_sec - before.tv_sec) * 1000 + (after.tv_nsec - before.tv_nsec) / 1000000;
         EXPECT_GE(wallMs, 500);
         EXPECT_LT(wallMs, 3000) << "parking is noticed while idling";
         EXPECT_LT(cpuMs, wallMs / 5) << "the reader spun on a node with nothing to give";
