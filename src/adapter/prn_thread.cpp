@@ -414,7 +414,9 @@ void USBAdapter_ReadPass(void) {
                 slPollTimeout = POLL_TIMEOUT_IDLE;
                 USBADP_LOG(INFO, "[USBAdp] Print channel poll timeout updated to 5sec\n");
             }
-            if (slRet != 0) idleRestOfPeriod(start, period);
+            // An empty transfer is a silence of its own; a hung-up node
+            // takes the period.
+            if (slRet < 0 || (revents & (POLLHUP | POLLERR | POLLNVAL))) idleRestOfPeriod(start, period);
             onSilence(d);
             return;
         }

@@ -1,6 +1,7 @@
 // Job framing: the reader's turns over host transfers, seen as the jobs Java
 // would get. The first rule everywhere: every byte the host sent as print data
 // is passed exactly once, in order.
+#include <chrono>
 #include <cstring>
 #include <random>
 #include <string>
@@ -131,6 +132,21 @@ TEST_F(Framing, DataWithoutUelIsOneJobUntilSilence) {
     EXPECT_FALSE(rec::Jobs()[0].ended);
     Silence();
     ExpectJobs({"Yabc"});
+}
+
+// An empty transfer reads as 0 bytes: it ends a job like a silence, at once,
+// also when UEL bytes are held for it.
+TEST_F(Framing, EmptyTransferEndsTheJobAtOnce) {
+    const auto start = std::chrono::steady_clock::now();
+    for (const char *data : {"page\x1b%-12", "more"}) {
+        vdev::HostWrite(vdev::kPrn, data);
+        vdev::HostWrite(vdev::kPrn, "");
+        USBAdapter_ReadPass();
+        USBAdapter_ReadPass();
+    }
+    ExpectJobs({"page\x1b%-12", "more"});
+    EXPECT_EQ(vdev::ExpiredPolls(vdev::kPrn), 0u) << "a silence, not the empty transfer, ended a job";
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(2)) << "an empty transfer took a period";
 }
 
 TEST_F(Framing, RefusedJobDropsItsChunkAndTheNextChunkTriesAgain) {
