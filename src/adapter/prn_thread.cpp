@@ -58,8 +58,14 @@ int pollPrn(int timeoutMs, short *revents) { return Wait_PollIn(fdPrn.load(), ti
 
 // The node said it was ready and gave nothing (hung up, closed, failed): the
 // poll period is over only when its time is, or the reader would spin.
-void idleRestOfPeriod(int64_t start, int periodMs) {
-    Wait_Idle(static_cast<int>(periodMs - (Wait_NowMs() - start)), shouldPark);
+void idleRestOfPeriod(int64_t start, int periodMs) { Wait_IdleRest(start, periodMs, shouldPark); }
+
+// A five-minute wait inside a UEL-framed job that saw no data falls back to
+// the idle wait.
+void fallBackAfterUelTimeout() {
+    if (slPollTimeout != POLL_TIMEOUT_UEL) return;
+    slPollTimeout = POLL_TIMEOUT_IDLE;
+    USBADP_LOG(INFO, "[USBAdp] Print channel poll timeout updated to 5sec\n");
 }
 
 // Opens a job if none is open. False when Java refused it; the chunk that
@@ -293,10 +299,7 @@ S32 USBAdapter_ReadDataClassifier(U8 *buf) {
         return -1;
     }
     if (r == 0) {
-        if (slPollTimeout == POLL_TIMEOUT_UEL) {
-            slPollTimeout = POLL_TIMEOUT_IDLE;
-            USBADP_LOG(INFO, "[USBAdp] Print channel poll timeout updated to 5sec\n");
-        }
+        fallBackAfterUelTimeout();
         return -1;
     }
     ssize_t n = Wait_Read(fdPrn.load(), buf, 2, shouldPark);
@@ -314,7 +317,7 @@ S32 USBAdapter_ReadDataClassifier(U8 *buf) {
     }
     // Ready but nothing to read: counts as no data.
     if (n == 0) {
-        if (revents & (POLLHUP | POLLERR | POLLNVAL)) idleRestOfPeriod(start, period);
+        if (Wait_HungUp(revents)) idleRestOfPeriod(start, period);
         return -1;
     }
     return static_cast<S32>(n);
@@ -410,13 +413,10 @@ void USBAdapter_ReadPass(void) {
         if (heldUel && prn_read_ret == 0) {
             // Nothing behind the held bytes: this pass was a silence.
             if (shouldPark()) return;
-            if (slRet == 0 && slPollTimeout == POLL_TIMEOUT_UEL) {
-                slPollTimeout = POLL_TIMEOUT_IDLE;
-                USBADP_LOG(INFO, "[USBAdp] Print channel poll timeout updated to 5sec\n");
-            }
+            if (slRet == 0) fallBackAfterUelTimeout();
             // An empty transfer is a silence of its own; a hung-up node
             // takes the period.
-            if (slRet < 0 || (revents & (POLLHUP | POLLERR | POLLNVAL))) idleRestOfPeriod(start, period);
+            if (slRet < 0 || Wait_HungUp(revents)) idleRestOfPeriod(start, period);
             onSilence(d);
             return;
         }

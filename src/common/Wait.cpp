@@ -1,6 +1,5 @@
 #include "common/Wait.h"
 
-#include <poll.h>
 #include <time.h>
 #include <unistd.h>
 
@@ -9,7 +8,7 @@
 
 namespace {
 
-// Longest single sleep of Wait_Idle: gone() is looked at this often, since the
+// Longest single sleep of Wait_IdleRest: gone() is looked at this often, since the
 // signal that changes it may land on another thread.
 constexpr int kIdleSliceMs = 50;
 
@@ -49,8 +48,8 @@ ssize_t Wait_Read(int fd, void *buf, size_t size, WaitGoneFn gone) {
     }
 }
 
-void Wait_Idle(int ms, WaitGoneFn gone) {
-    const int64_t deadline = Wait_NowMs() + std::max(ms, 0);
+void Wait_IdleRest(int64_t startMs, int periodMs, WaitGoneFn gone) {
+    const int64_t deadline = startMs + std::max(periodMs, 0);
     for (int left = remaining(deadline); left > 0; left = remaining(deadline)) {
         if (gone && gone()) return;
         timespec ts{0, static_cast<long>(std::min(left, kIdleSliceMs)) * 1000000L};

@@ -5,6 +5,7 @@
 // postpones a time-out.
 #pragma once
 
+#include <poll.h>
 #include <sys/types.h>
 
 #include <cstddef>
@@ -27,6 +28,11 @@ int Wait_PollIn(int fd, int timeoutMs, short *revents, WaitGoneFn gone = nullptr
 // stop.
 ssize_t Wait_Read(int fd, void *buf, size_t size, WaitGoneFn gone = nullptr);
 
-// Lets `ms` pass without spinning (a channel that reports readiness but gives
-// nothing must not be polled in a tight loop); returns early when gone().
-void Wait_Idle(int ms, WaitGoneFn gone = nullptr);
+// A descriptor reporting any of these is ready again at once and gives
+// nothing (hung up, failed, closed).
+inline bool Wait_HungUp(short revents) { return (revents & (POLLHUP | POLLERR | POLLNVAL)) != 0; }
+
+// Lets the rest of a wait that began at startMs and was to last periodMs pass
+// without spinning (a channel that reports readiness but gives nothing must
+// not be polled in a tight loop); returns early when gone().
+void Wait_IdleRest(int64_t startMs, int periodMs, WaitGoneFn gone = nullptr);

@@ -1,6 +1,5 @@
 #include "maa/MAA_Driver.h"
 
-#include <poll.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -48,9 +47,8 @@ U32 DM_ReadDriverInto(U32 ulHandle, U8 *pubDest, U32 ulReadSize, U32 *pulReturnS
         // and gives nothing: the period is over only when its time is, or the
         // line readers that retry on a time-out would spin. (An empty transfer
         // is a time-out of its own and is gone once read.)
-        const bool broken = (r < 0 && !stopped) || (r > 0 && count < 0 && !stopped) ||
-                            (r > 0 && (revents & (POLLHUP | POLLERR | POLLNVAL)));
-        if (broken) Wait_Idle(static_cast<int>(period - (Wait_NowMs() - start)), cableGone);
+        const bool broken = !stopped && (r < 0 || count < 0 || (r > 0 && Wait_HungUp(revents)));
+        if (broken) Wait_IdleRest(start, period, cableGone);
         if (!stopped && period == MAA_POLL_TIMEOUT_FIRST) maa_session::slPollTimeout = MAA_POLL_TIMEOUT;
         if (MAA_IsUSBDisconnected()) {
             USBADP_LOG(ERROR, "\r\n[MAA] ReadDriver: USB Disconnected");

@@ -33,8 +33,6 @@ constexpr size_t kSerialStringSize = 40;
 // Lines of Dump_File. Not the session's line buffer: the parser may still be
 // reading the rest of the command line from there after the call.
 U8 aubDumpLine[MAA_LINE_SIZE + 1];
-// Where the bytes of a download without a buffer go.
-U8 aubDiscard[FILE_BUFFERSIZE];
 
 bool runMode() { return enSpecialMode == MAA_JIG_RUN_CMD || enSpecialMode == MAA_AUTO_RUN_CMD; }
 
@@ -169,9 +167,10 @@ U32 MAA_ReadFile(U32 ulFileSize) {
             // Straight into the download; without one (it could not be
             // allocated) the bytes are still taken.
             const bool fits = buffer != nullptr && total + piece <= capacity;
-            U8 *dest = fits ? buffer + total + got : aubDiscard;
+            U8 *discarded = nullptr;
             U32 n = 0;
-            U32 r = DM_ReadDriverInto(ulDrvHandle.load(), dest, std::min(piece - got, FILE_BUFFERSIZE), &n);
+            U32 r = fits ? DM_ReadDriverInto(ulDrvHandle.load(), buffer + total + got, piece - got, &n)
+                         : DM_ReadDriver(ulDrvHandle.load(), &discarded, piece - got, &n, nullptr);
             if (r != DM_RET_OK) {
                 USBADP_LOG(ERROR, "\r\n[MAA:MAA_ReadFile] Invalid DM Read Return(%d)", static_cast<int>(r));
                 MAA_DownloadZeroFrom(total + got);

@@ -82,23 +82,13 @@ TEST_F(SessionTest, LineReaderDoesNotSpinOnAChannelThatGivesNothing) {
         SCOPED_TRACE(r.name);
         IsDisconnected = 0;
         maa_session::slPollTimeout = MAA_POLL_TIMEOUT;
-        std::thread puller([] {
-            std::this_thread::sleep_for(std::chrono::milliseconds(600));
-            IsDisconnected = 1;
-        });
-        const long cpuBefore = ThreadCpuMs();
-        const auto start = std::chrono::steady_clock::now();
         U8 buf[MAA_LINE_BUFFER_SIZE];
-        MAA_ReadLine(static_cast<U32>(r.handle), buf);
-        const long cpuMs = ThreadCpuMs() - cpuBefore;
-        const long wallMs = static_cast<long>(std::chrono::duration_cast<std::chrono::milliseconds>(
-                                                  std::chrono::steady_clock::now() - start)
-                                                  .count());
-        puller.join();
+        const WorkTime t = TimeUntilStopped([&] { MAA_ReadLine(static_cast<U32>(r.handle), buf); },
+                                            [] { IsDisconnected = 1; }, 600);
         EXPECT_EQ(buf[0], 0);
-        EXPECT_GE(wallMs, 500);
-        EXPECT_LT(wallMs, 3000) << "the pulled cable is noticed while waiting";
-        EXPECT_LT(cpuMs, wallMs / 5) << "the line reader spun";
+        EXPECT_GE(t.wallMs, 500);
+        EXPECT_LT(t.wallMs, 3000) << "the pulled cable is noticed while waiting";
+        EXPECT_LT(t.cpuMs, t.wallMs / 5) << "the line reader spun";
     }
     IsDisconnected = 0;
 }

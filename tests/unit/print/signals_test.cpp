@@ -92,20 +92,14 @@ TEST_F(ReaderSignals, HungUpNodeDoesNotMakeTheReaderSpin) {
             Send({r.before}, false);
         }
         vdev::Reset();  // the reader's descriptor is dead: ready, and reads give 0
-        std::thread parker([] {
-            std::this_thread::sleep_for(std::chrono::milliseconds(600));
-            IsConfigured = 0;
-        });
-        const long cpuBefore = ThreadCpuMs();
-        const auto start = Clock::now();
-        for (int passes = 0; IsConfigured && passes < 1000000; ++passes) USBAdapter_ReadPass();
-        const long cpuMs = ThreadCpuMs() - cpuBefore;
-        const long wallMs =
-            static_cast<long>(std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - start).count());
-        parker.join();
-        EXPECT_GE(wallMs, 500);
-        EXPECT_LT(wallMs, 3000) << "parking is noticed while idling";
-        EXPECT_LT(cpuMs, wallMs / 5) << "the reader spun on a node with nothing to give";
+        const WorkTime t = TimeUntilStopped(
+            [] {
+                for (int passes = 0; IsConfigured && passes < 1000000; ++passes) USBAdapter_ReadPass();
+            },
+            [] { IsConfigured = 0; }, 600);
+        EXPECT_GE(t.wallMs, 500);
+        EXPECT_LT(t.wallMs, 3000) << "parking is noticed while idling";
+        EXPECT_LT(t.cpuMs, t.wallMs / 5) << "the reader spun on a node with nothing to give";
         USBAdapter_EndJobOnPark();
         auto jobs = rec::Jobs();
         ASSERT_EQ(jobs.size(), r.jobs);
