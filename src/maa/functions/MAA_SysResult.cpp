@@ -10,6 +10,8 @@
 #include <cstring>
 
 #include "common/Log.h"
+#include "common/Wait.h"
+#include "adapter/USB.h"
 #include "maa/MAA_IF.h"
 #include "maa/MAA_Result.h"
 
@@ -20,6 +22,9 @@ U32 ulCIP6MaaResultSize = 0;
 namespace {
 
 TMAACommandRunner pfnCommandRunner = nullptr;
+TMAASleeper pfnSleeper = nullptr;
+
+bool cableGone() { return MAA_IsUSBDisconnected() != 0; }
 
 // Text into the data area, cut so a terminating NUL always fits.
 U32 copyText(const U8 *message) {
@@ -113,3 +118,13 @@ void MAA_SetCommandRunner(TMAACommandRunner pfnRunner) { pfnCommandRunner = pfnR
 int MAA_System(const char *command) { return run(command, TMAARunVia::System); }
 
 int execbin(const char *command) { return run(command, TMAARunVia::Execbin); }
+
+void MAA_SetSleeper(TMAASleeper pfn) { pfnSleeper = pfn; }
+
+void MAA_SleepMs(U32 ulMs) {
+    if (pfnSleeper != nullptr) {
+        pfnSleeper(ulMs);
+        return;
+    }
+    Wait_IdleRest(Wait_NowMs(), static_cast<int>(ulMs > 0x7FFFFFFFu ? 0x7FFFFFFFu : ulMs), &cableGone);
+}

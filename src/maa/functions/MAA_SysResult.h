@@ -44,3 +44,11 @@ int MAA_System(const char *command);
 // The command through "/bin/sh -c" (fork/execl), waited for; its exit status,
 // -1 when it could not be started.
 int execbin(const char *command);
+
+// ---- pauses
+// Every pause a test function makes (retry waits, settling times) goes through
+// here, so tests can make them virtual. The default sleeps, resuming after
+// signals, and returns early when the USB cable is pulled.
+using TMAASleeper = void (*)(U32 ulMs);
+void MAA_SetSleeper(TMAASleeper pfnSleeper);  // nullptr restores the default
+void MAA_SleepMs(U32 ulMs);

@@ -2,6 +2,7 @@
 // records reach the wire, with what status, result and bytes.
 #include <gtest/gtest.h>
 
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -153,3 +154,18 @@ TEST(CommandRunner, ExecbinRunsThroughTheShellAndGivesTheExitStatus) {
 }
 
 }  // namespace
+
+namespace {
+std::vector<U32> pauses;
+void recordPause(U32 ms) { pauses.push_back(ms); }
+}  // namespace
+
+TEST(Pauses, AReplacedSleeperTakesEveryPauseAndTheDefaultReallyWaits) {
+    MAA_SetSleeper(&recordPause);
+    MAA_SleepMs(1000);
+    MAA_SetSleeper(nullptr);
+    EXPECT_EQ(pauses, std::vector<U32>{1000});
+    auto start = std::chrono::steady_clock::now();
+    MAA_SleepMs(120);
+    EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::milliseconds(100));
+}
