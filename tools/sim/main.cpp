@@ -76,7 +76,8 @@ const char kUsage[] =
     "\n"
     "Exit status: 0 every command passed, 1 a command or expectation failed,\n"
     "2 usage or script error, 3 start-up failed (JVM, library or print reader).\n"
-    "Environment: USBADAPTER_LOG (default OUT/usbadapter.log), USBADAPTER_LOG_LEVEL.\n";
+    "Environment: USBADAPTER_LOG (default OUT/usbadapter.log), USBADAPTER_LOG_LEVEL,\n"
+    "USBADAPTER_COMMAND_LOG (default OUT/commands.log).\n";
 
 struct Options {
     std::vector<sim::ScriptLine> lines;
@@ -240,6 +241,7 @@ void ClearOutDir(const std::string &dir) {
     for (const auto &entry : fs::directory_iterator(dir, ec)) {
         const std::string name = entry.path().filename().string();
         bool ours = name == "journal.jsonl" || name == "session.jsonl" || name == "usbadapter.log" ||
+                    name == "commands.log" ||
                     (name.rfind("job-", 0) == 0 && name.size() > 4 && name.substr(name.size() - 4) == ".prn") ||
                     (name.rfind("app-", 0) == 0 && name.size() > 4 && name.substr(name.size() - 4) == ".bin");
         if (ours) fs::remove(entry.path(), ec);
@@ -393,6 +395,9 @@ int main(int argc, char **argv) {
     s.javaJournal.SetPath(o.outDir + "/journal.jsonl");
     if (!PrepareRoot(o, &error)) StartupFailed(o, error);
     ::setenv("USBADAPTER_LOG", (Absolute(o.outDir) + "/usbadapter.log").c_str(), 0);
+    // The test functions' shell commands (killall, rm -rf, device scripts) are
+    // meant for the controller: on a PC they are recorded, never run.
+    ::setenv("USBADAPTER_COMMAND_LOG", (Absolute(o.outDir) + "/commands.log").c_str(), 0);
 
     StartService(o);
     if (o.plug && !sim::FindCommand("plug")->run(s, {}, &error)) StartupFailed(o, error);
