@@ -59,8 +59,10 @@ TEST_F(CpuTemperatureJvm, StartAndEndCallTheirJavaMethodsAndReportTheReply) {
     EXPECT_EQ(Run(0), (std::vector<Rec>{{C, "[ CPU_TEMP_START ]"}, {C, "CPU_TEMP_START = OK"},
                                         {E, "CPU temperature recording started"}}));
     fixtures::SetReply("maaCheckCPUTemperatureEnd", "max 61.5 C\nmin 40.0 C");
-    EXPECT_EQ(Run(1), (std::vector<Rec>{{C, "[ CPU_TEMP_END ]"}, {C, "CPU_TEMP_END = OK"}, {E, "max 61.5 C\nmin 40.0 C"}}));
-    EXPECT_EQ(fixtures::EventLines(), (std::vector<std::string>{"maaCheckCPUTemperatureStart", "maaCheckCPUTemperatureEnd"}));
+    EXPECT_EQ(Run(1), (std::vector<Rec>{{C, "[ CPU_TEMP_END ]"}, {C, "CPU_TEMP_END = OK"},
+                                        {E, "max 61.5 C\nmin 40.0 C"}}));
+    EXPECT_EQ(fixtures::EventLines(),
+              (std::vector<std::string>{"maaCheckCPUTemperatureStart", "maaCheckCPUTemperatureEnd"}));
 }
 
 TEST_F(CpuTemperatureJvm, ALongReplyIsCutToItsBuffer) {
@@ -83,7 +85,8 @@ TEST_F(CpuTemperatureJvm, RefusedCasesNeverReachJava) {
 TEST_F(CpuTemperatureJvm, JavaFailuresEndTheTestAndAreCleared) {
     Start();
     if (HasFatalFailure()) return;
-    const std::vector<Rec> noReply{{C, "[ CPU_TEMP_END ]"}, {C, "CPU_TEMP_END = OK"}, {E, "Failed jcheckCPUTemperature NULL"}};
+    const std::vector<Rec> noReply{
+        {C, "[ CPU_TEMP_END ]"}, {C, "CPU_TEMP_END = OK"}, {E, "Failed jcheckCPUTemperature NULL"}};
     fixtures::ReturnNull("maaCheckCPUTemperatureEnd");
     EXPECT_EQ(Run(1), noReply);
     fixtures::ReturnNull("maaCheckCPUTemperatureEnd", false);

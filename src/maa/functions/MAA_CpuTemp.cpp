@@ -134,8 +134,8 @@ TMAAResult *javaTemperature(JNIEnv *env, jobject daemon, bool start) {
     LocalRef<jclass> cls(env, env->GetObjectClass(daemon));
     if (!cls) return report("Failed", 1);
     report(start ? "[ CPU_TEMP_START ]" : "[ CPU_TEMP_END ]", 0);
-    jmethodID mid =
-        env->GetMethodID(cls.get(), start ? "maaCheckCPUTemperatureStart" : "maaCheckCPUTemperatureEnd", kTempMethodSig);
+    const char *method = start ? "maaCheckCPUTemperatureStart" : "maaCheckCPUTemperatureEnd";
+    jmethodID mid = env->GetMethodID(cls.get(), method, kTempMethodSig);
     if (!mid) {
         JNI_ExceptionSweep(env);
         return report("Failed midCheckCPUTemperature NULL", 1);

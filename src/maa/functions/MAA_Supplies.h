@@ -178,7 +178,10 @@ static_assert(offsetof(TSuppliesInfoData, ulPunchWasteHopper) == 8812);
 extern TSuppliesInfoData gstSuppliesInfoData;
 extern FILE *pf_report_file;
 
-// Registered as GetSuppliesInfoReport.
+// Registered as GetSuppliesInfoReport. A supplies file without even its
+// version word gives no report (an earlier one is removed), so the upload ends
+// the test with its stat failure; a short file is reported, and the part of the
+// record it lacks reads as zero, never as an earlier file's counters.
 TMAAResult *Get_SuppliesInfo_Report();
 
 // Appends the text to pf_report_file and flushes (nothing without a report file).

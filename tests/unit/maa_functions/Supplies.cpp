@@ -79,7 +79,8 @@ protected:
     std::vector<std::string> Writes() {
         std::vector<std::string> out;
         std::string buf(1 << 16, '\0');
-        for (ssize_t n; (n = ::recv(sp[1], buf.data(), buf.size(), MSG_DONTWAIT)) >= 0;) out.push_back(buf.substr(0, n));
+        for (ssize_t n; (n = ::recv(sp[1], buf.data(), buf.size(), MSG_DONTWAIT)) >= 0;)
+            out.push_back(buf.substr(0, n));
         return out;
     }
     static std::vector<Rec> Seen(const TMAAResult *r) {
