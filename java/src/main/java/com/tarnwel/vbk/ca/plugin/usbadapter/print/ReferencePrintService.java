@@ -174,6 +174,16 @@ public class ReferencePrintService extends USBPrintDaemon {
         return call("maaEngMaaOpcodeFTCATest", command, super.maaEngMaaOpcodeFTCATest(command));
     }
 
+    @Override
+    public String maaCheckCPUTemperatureStart() {
+        return call("maaCheckCPUTemperatureStart", null, super.maaCheckCPUTemperatureStart());
+    }
+
+    @Override
+    public String maaCheckCPUTemperatureEnd() {
+        return call("maaCheckCPUTemperatureEnd", null, super.maaCheckCPUTemperatureEnd());
+    }
+
     /**
      * Writes "job-end" for every job whose end the reader has marked. Under the
      * service's lock, so a job is never counted as ended before its line is out.

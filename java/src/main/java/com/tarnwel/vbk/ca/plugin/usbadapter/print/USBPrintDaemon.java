@@ -111,6 +111,7 @@ public class USBPrintDaemon extends USBAdapterPrintAndScanJNIService {
         return noEngine(command);
     }
 
+    /** CPU temperature recording of a factory run; the reply is the host's final record (at most 4999 bytes). */
     public String maaCheckCPUTemperatureStart() {
         return "CPU temperature recording started";
     }
