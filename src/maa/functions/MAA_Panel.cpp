@@ -30,9 +30,12 @@ constexpr size_t kAddressLength = sizeof kDefaultAddress - 1;  // 15
 
 // The UI server is local, so a connection is made at once or never; answers
 // wait for an operator working the panel, hence the long answer wait.
-int connectWaitMs = 5000;
-int acceptWaitMs = 60000;
-int answerWaitMs = 300000;
+constexpr int kConnectWaitMs = 5000;
+constexpr int kAcceptWaitMs = 60000;
+constexpr int kAnswerWaitMs = 300000;
+int connectWaitMs = kConnectWaitMs;
+int acceptWaitMs = kAcceptWaitMs;
+int answerWaitMs = kAnswerWaitMs;
 
 bool cableGone() { return MAA_IsUSBDisconnected() != 0; }
 
@@ -218,9 +221,9 @@ TMAAResult *uiListeningTest(const char *header, U8 command, const char *success)
 }  // namespace
 
 void MAA_PanelSetWaits(int connectMs, int acceptMs, int answerMs) {
-    connectWaitMs = connectMs;
-    acceptWaitMs = acceptMs;
-    answerWaitMs = answerMs;
+    connectWaitMs = connectMs > 0 ? connectMs : kConnectWaitMs;
+    acceptWaitMs = acceptMs > 0 ? acceptMs : kAcceptWaitMs;
+    answerWaitMs = answerMs > 0 ? answerMs : kAnswerWaitMs;
 }
 
 TMAAResult *UISSM_IF_KeyInTest() { return uiListeningTest("[ UISSM_IF_KeyInTest ]", '1', "KEY TEST DONE"); }

@@ -28,5 +28,6 @@ TMAAResult *UISSM_MAA_USB_Test_And_Cli();
 
 // Bounds of the panel tests' waits in milliseconds: connecting to the UI server,
 // the UI server connecting to a listening test, and its answer (the answer
-// waits for an operator: minutes by default). Tests shorten them.
+// waits for an operator: minutes by default). Tests shorten them; 0 restores
+// a default.
 void MAA_PanelSetWaits(int connectMs, int acceptMs, int answerMs);

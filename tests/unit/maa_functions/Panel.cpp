@@ -53,7 +53,7 @@ protected:
     void TearDown() override {
         MAA_SetResultWriter(nullptr);
         ::unsetenv("USBADAPTER_UI_PORT");
-        MAA_PanelSetWaits(5000, 60000, 300000);
+        MAA_PanelSetWaits(0, 0, 0);
     }
 
     void writeAddress(const std::string &text) { std::ofstream(root / kAddressFile, std::ios::binary) << text; }
