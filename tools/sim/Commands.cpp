@@ -2,6 +2,8 @@
 // watches the library's own progress: vdev's records of host transfers and
 // polls, the reader thread's blocking call, the Java side's journal.
 #include <cstdlib>
+#include <filesystem>
+#include <memory>
 #include <fstream>
 #include <sstream>
 #include <thread>
@@ -11,6 +13,7 @@
 #include "Script.h"
 #include "Sha256.h"
 #include "ShellCommands.h"
+#include "UiPeer.h"
 #include "usbadapter/mfpbridge.h"
 #include "vdev.h"
 
@@ -478,6 +481,42 @@ bool Note(Session &s, const Args &a, std::string *) {
     return true;
 }
 
+// ---- operator panel -------------------------------------------------------------
+
+// The UI server the panel tests reach; lives until replaced, stopped or the end.
+std::unique_ptr<uipeer::Server> uiServer;
+
+bool UiServer(Session &s, const Args &a, std::string *error) {
+    if (uiServer) {
+        std::string requests;
+        for (const std::string &r : uiServer->requests()) requests += (requests.empty() ? "" : " ") + Hex(r);
+        uiServer.reset();
+        s.Sim(JsonLine("ui-server").Str("state", "stopped").Str("requests", requests));
+    }
+    if (a[0] == "stop") return true;
+    const char *root = std::getenv("USBADAPTER_ROOT");
+    if (root == nullptr || *root == 0) {
+        *error = "no root for the UI server's address file";
+        return false;
+    }
+    auto server = std::make_unique<uipeer::Server>(uipeer::AnswerAll(a[0]));
+    if (!server->ok()) {
+        *error = "the UI server cannot listen on 127.0.0.1";
+        return false;
+    }
+    const std::string dir = std::string(root) + "/root/Halvard/osgi";
+    std::error_code ec;
+    std::filesystem::create_directories(dir, ec);
+    if (!(std::ofstream(dir + "/socketAddress.prop", std::ios::binary) << "127.000.000.001")) {
+        *error = "cannot write " + dir + "/socketAddress.prop";
+        return false;
+    }
+    ::setenv("USBADAPTER_UI_PORT", std::to_string(server->port()).c_str(), 1);
+    s.Sim(JsonLine("ui-server").Str("answer", a[0]).Num("port", server->port()));
+    uiServer = std::move(server);
+    return true;
+}
+
 const std::vector<Command> kCommands = {
     {"plug", "",
      "the host configures the device (MFP_DEV_CONFIGURED); the first time, waits until the print reader reads", 0, 0,
@@ -527,6 +566,10 @@ const std::vector<Command> kCommands = {
      "hands the print channel to a host tool: a pseudo-terminal, LINK a symbolic link to it, opened as a printer's "
      "device node; returns when the tool has closed it",
      2, 2, CheckPty, Pty},
+    {"ui-server", "ANSWER|stop",
+     "starts the operator panel's UI server on 127.0.0.1, answering every panel test with ANSWER (e.g. 9); stop "
+     "ends it and journals the requests it received",
+     1, 1, nullptr, UiServer},
 };
 
 }  // namespace

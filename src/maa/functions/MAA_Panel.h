@@ -1,5 +1,7 @@
 // Operator-panel tests: each talks to the UI server over TCP (or, for the two
-// listening tests, lets it connect).
+// listening tests, lets it connect). The server's address comes from
+// /root/Halvard/osgi/socketAddress.prop (default 127.254.254.253), its port is
+// 10000 unless USBADAPTER_UI_PORT names another (PC runs and tests).
 #pragma once
 
 #include "maa/MAA_Types.h"
@@ -23,3 +25,9 @@ TMAAResult *UISSM_MAA_HAPTIC_And_Cli(U32);
 TMAAResult *UISSM_MAA_SpeakerTest_And_Cli(U32);
 TMAAResult *SetUIEnable();
 TMAAResult *UISSM_MAA_USB_Test_And_Cli();
+
+// Bounds of the panel tests' waits in milliseconds: connecting to the UI server,
+// the UI server connecting to a listening test, and its answer (the answer
+// waits for an operator: minutes by default). Tests shorten them; 0 restores
+// a default.
+void MAA_PanelSetWaits(int connectMs, int acceptMs, int answerMs);

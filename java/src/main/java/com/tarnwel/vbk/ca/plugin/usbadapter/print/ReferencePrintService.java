@@ -184,6 +184,11 @@ public class ReferencePrintService extends USBPrintDaemon {
         return call("maaCheckCPUTemperatureEnd", null, super.maaCheckCPUTemperatureEnd());
     }
 
+    @Override
+    public String maaSetUIEnable() {
+        return call("maaSetUIEnable", null, super.maaSetUIEnable());
+    }
+
     /**
      * Writes "job-end" for every job whose end the reader has marked. Under the
      * service's lock, so a job is never counted as ended before its line is out.

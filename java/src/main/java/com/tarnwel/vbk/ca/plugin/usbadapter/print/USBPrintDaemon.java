@@ -120,6 +120,11 @@ public class USBPrintDaemon extends USBAdapterPrintAndScanJNIService {
         return "CPU temperature recording stopped";
     }
 
+    /** The test shell asks for the operator panel to be switched on; the reply goes to the host. */
+    public String maaSetUIEnable() {
+        return "SetUIEnable = OK";
+    }
+
     public String getModelName() {
         return modelName;
     }
