@@ -4,11 +4,20 @@
 #include <jni.h>
 
 #include <atomic>
+#include <string>
 #include <utility>
 
 // Describes and clears a pending Java exception so a failing Java method never
 // stops a native loop. Returns true when there was one.
 bool JNI_ExceptionSweep(JNIEnv *env);
+
+// Bytes from a USB host as the modified UTF-8 that NewStringUTF requires:
+// well-formed UTF-8 is kept (characters above U+FFFF become surrogate pairs),
+// every byte that is not part of a well-formed sequence becomes '?'.
+std::string JNI_HostTextToModifiedUtf8(const char *text);
+// A Java string of host bytes (see above) as a new local reference; null
+// (with the JVM's error pending) when it cannot be made.
+jstring JNI_NewHostString(JNIEnv *env, const char *text);
 
 // A local reference deleted when it goes out of scope.
 template <typename T>

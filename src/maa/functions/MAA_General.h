@@ -12,9 +12,20 @@
 // 100 characters, or when the Java array cannot be made.
 TMAAResult *MAA_GENERAL_FUNCTION(U32 argc, U32 *args);
 
+// Argument words up to this bound are numbers, those above it text addresses.
+constexpr U32 MAA_GENERAL_NUMBER_LIMIT = 1000000;
+// Buffer of one argument text: a text of more than this many characters is
+// refused; one of exactly this many is cut to fit the buffer with its NUL.
+constexpr U32 MAA_GENERAL_ARG_SIZE = 100;
+// The text the Java side receives for one argument word: a number in decimal,
+// or the text at the address with "%%" read as "%" (any other '%' stays as it
+// stands: a host's text is never a format that consumes arguments). False
+// (logged) for a refused address or a text over MAA_GENERAL_ARG_SIZE characters.
+bool MAA_UsbFunctionArgText(U32 ulWord, char (&aubText)[MAA_GENERAL_ARG_SIZE]);
+
 enum class TMAAJavaCall {
     Reply,     // *reply holds the Java reply
-    NoReply,   // no object, no method, or the method returned null (logged)
+    NoReply,   // no Java environment or object, no method, or no reply (logged)
     BadArgs,   // more than 10 arguments or a text over 100 characters
 };
 // Calls "runUsbFunctionCall" on globalMAAObj with `id` and the argument words

@@ -32,14 +32,18 @@ import java.util.concurrent.TimeUnit;
  *     {"event":"app-start","app":N,"type":"<type>"}
  *     {"event":"app-end","app":N,"type":"<type>","bytes":B,"sha256":"<hex>","file":"app-NNN-TYPE.bin"}
  *     {"event":"call","method":"<daemon method>","arg":"<argument>","reply":"<reply>"}
- *       ("arg" and "reply" only where the method has them)
+ *       ("arg" and "reply" only where the method has them; for runUsbFunctionCall on
+ *       the MAA object "arg" is ID(ARG0,ARG1,...))
+ * With no engine attached, engine commands answer "OK:" and the command, and a
+ * general function that no one registered on the MAA object answers
+ * "OK:ID(ARG0,ARG1,...)", so a host script sees what reached Java.
  * The library marks a job's end only through the handler's fileParsingStatus,
  * so "job-end" is written when that is seen: by a 10 ms poll, or at the next
  * call-back, whichever comes first. A job still open at exit gets no "job-end".
  */
 public class ReferencePrintService extends USBPrintDaemon {
     private final Path outDir;
-    private final USBMaaService maa = new USBMaaService();
+    private final USBMaaService maa = new JournaledMaaService();
     private final List<FileJob> openJobs = new ArrayList<>();
     private final ScheduledExecutorService watcher;
     private int jobCount;
@@ -161,17 +165,32 @@ public class ReferencePrintService extends USBPrintDaemon {
 
     @Override
     public String maaEngMaaStrNormalTest(String command) {
-        return call("maaEngMaaStrNormalTest", command, super.maaEngMaaStrNormalTest(command));
+        return call("maaEngMaaStrNormalTest", command, engineAnswer(command));
     }
 
     @Override
     public String maaEngMaaImageStabilization(String command) {
-        return call("maaEngMaaImageStabilization", command, super.maaEngMaaImageStabilization(command));
+        return call("maaEngMaaImageStabilization", command, engineAnswer(command));
     }
 
     @Override
     public String maaEngMaaOpcodeFTCATest(String command) {
-        return call("maaEngMaaOpcodeFTCATest", command, super.maaEngMaaOpcodeFTCATest(command));
+        return call("maaEngMaaOpcodeFTCATest", command, engineAnswer(command));
+    }
+
+    /** The simulated engine's answer to an engine test command. */
+    private static String engineAnswer(String command) {
+        return "OK:" + command;
+    }
+
+    /** The MAA object handed to the print reader: general functions, journaled. */
+    private final class JournaledMaaService extends USBMaaService {
+        @Override
+        public String runUsbFunctionCall(String functionId, String[] args) {
+            String shown = functionId + "(" + (args == null ? "" : String.join(",", args)) + ")";
+            String reply = super.runUsbFunctionCall(functionId, args);
+            return call("runUsbFunctionCall", shown, reply != null ? reply : "OK:" + shown);
+        }
     }
 
     @Override
