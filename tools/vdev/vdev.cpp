@@ -40,6 +40,10 @@ namespace {
 constexpr NodeModel kNodes[] = {
     {MS_PRN_FILE_NAME, BridgePrnReadTimeout, BridgeIoctl, BridgeReset, true},
     {MS_SCAN_FILE_NAME, BridgeScanReadTimeout, BridgeIoctl, BridgeReset, true},
+    {SCAN_DEVICE_NAME, nullptr, ScannerIoctl, ScannerReset, false},
+    {FAX_DEVICE_NAME, nullptr, FaxIoctl, FaxReset, false},
+    {JBIG_ENC_DEVICE_NAME, nullptr, JbigIoctl, JbigReset, false},
+    {JBIG_DEC_DEVICE_NAME, nullptr, JbigIoctl, JbigReset, false},
 };
 constexpr int kNodeCount = static_cast<int>(std::size(kNodes));
 static_assert(kNodeCount < 255);
