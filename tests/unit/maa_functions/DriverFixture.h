@@ -35,23 +35,16 @@ inline std::ostream &operator<<(std::ostream &os, const Record &r) {
 inline std::vector<Record> records;
 inline std::vector<U32> sleeps;
 
-inline void capture(const TMAAResult *r) {
-    records.push_back({r->enContinue, r->ulResult,
-                       std::string(reinterpret_cast<const char *>(r->pubData), r->pubData ? r->ulDataSize : 0)});
+inline Record Returned(const TMAAResult *r) {
+    return {r->enContinue, r->ulResult,
+            std::string(reinterpret_cast<const char *>(r->pubData), r->pubData ? r->ulDataSize : 0)};
 }
+inline void capture(const TMAAResult *r) { records.push_back(Returned(r)); }
 inline void sleepVirtually(U32 ms) { sleeps.push_back(ms); }
 
 inline Record End0(const std::string &text) { return {MAA_RESULT_END, 0, text}; }
 inline Record End1(const std::string &text) { return {MAA_RESULT_END, 1, text}; }
 inline Record Cont(const std::string &text) { return {MAA_RESULT_CONTINUE, 1, text}; }
-
-inline Record Returned(const TMAAResult *r) {
-    Record out;
-    capture(r);
-    out = records.back();
-    records.pop_back();
-    return out;
-}
 
 // Requests made on a node, in order.
 inline std::vector<unsigned long> Requests(const char *path) {
