@@ -71,6 +71,8 @@ void Reset();
 void SetPresent(const char *path, bool present);
 // Number of descriptors currently open on the node.
 int OpenCount(const char *path);
+// Successful opens of the node since Reset().
+size_t Opens(const char *path);
 
 // ---- host side -----------------------------------------------------------
 // One host transfer: the library's read() returns at most one transfer's bytes

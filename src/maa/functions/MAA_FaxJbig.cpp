@@ -6,6 +6,7 @@
 
 #include <cstdio>
 #include <cstring>
+#include <optional>
 
 #include "common/Log.h"
 #include "common/UniqueFd.h"
@@ -38,9 +39,10 @@ private:
 // The command on the fax driver, under the scanner lock when asked; nullptr or
 // the failure text.
 const char *runOnFax(TFaxMAATest &rec, bool scannerLock) {
-    DriverFd scanner(fdScnDrv, SCAN_DEVICE_NAME);
+    std::optional<DriverFd> scanner;
     if (scannerLock) {
-        if (!scanner.open()) return "critical error! failed to open scan device";
+        scanner.emplace(fdScnDrv, SCAN_DEVICE_NAME);
+        if (!scanner->open()) return "critical error! failed to open scan device";
         if (!MAA_ScanAppLock(fdScnDrv)) return "scanner is busy or in sleep";
     }
     const char *failure = nullptr;

@@ -48,6 +48,7 @@ TEST_F(FaxJbig, EachFaxFunctionSendsItsLineAndWritesHeaderAndResponse) {
             c.scannerLock ? std::vector<unsigned long>{IOCNR_SCAN_APP_LOCK, IOCNR_SCAN_APP_LOCK_RELEASE}
                           : std::vector<unsigned long>{};
         EXPECT_EQ(Requests(vdev::kScanner), expected);
+        EXPECT_EQ(vdev::Opens(vdev::kScanner), c.scannerLock ? 1u : 0u);
         EXPECT_EQ(vdev::OpenCount(vdev::kScanner) + vdev::OpenCount(vdev::kFax), 0);
         EXPECT_EQ(fdFaxDrv, -1);
         EXPECT_EQ(fdScnDrv, -1);
