@@ -42,7 +42,9 @@ TMAAResult *PWM_Scan_Test(U32, U32, U32, U32, U32, U32, U32);
 TMAAResult *ScanMotorTest(U32);
 TMAAResult *ScanPatchDetect_Test();
 TMAAResult *ScanToInspectionDust();
-TMAAResult *SFRReadWrite(U32, U32, U32);  // the second argument is a text
+// The second argument is the address of a text; one the address map refuses
+// ends the command with "critical error! invalid text argument" (driver untouched).
+TMAAResult *SFRReadWrite(U32, U32, U32);
 TMAAResult *Step_Mot_Test_Scan(U32, U32, U32, U32);
 TMAAResult *SysPBA_IO_Scn_GPITest(U32, U32, U32);
 TMAAResult *SysPBA_IO_Scn_GPOTest(U32, U32, U32, U32);
