@@ -25,6 +25,7 @@ struct Sink {
         }
         if (const char *lvl = std::getenv("USBADAPTER_LOG_LEVEL"); lvl && *lvl) {
             if (!std::strcmp(lvl, "ERROR")) threshold = 40000;
+            else if (!std::strcmp(lvl, "WARN")) threshold = 30000;
             else if (!std::strcmp(lvl, "INFO")) threshold = 20000;
             else if (!std::strcmp(lvl, "FINE") || !std::strcmp(lvl, "DEBUG")) threshold = 10000;
             else if (!std::strcmp(lvl, "OFF")) threshold = 1 << 30;

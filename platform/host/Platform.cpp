@@ -1,8 +1,45 @@
 // Host stand-ins of the controller's platform services a PC lacks.
 #include <cstdlib>
 #include <cstring>
+#include <iterator>
+#include <map>
+#include <mutex>
 
 #include "platform/Platform.h"
+
+namespace {
+
+// Data blocks are plain heap buffers. Each live block also gets a 32-bit
+// "kernel address" of its own, so that a driver model given that address (as a
+// real driver is) can find the memory again; a released block's address no
+// longer translates.
+struct HostDataBlock {
+    void *memory;
+    uint32_t size;
+    uint32_t kerAddr;
+};
+
+constexpr uint64_t kKerBase = 0xC0000000u;
+constexpr uint64_t kKerEnd = 0xFFFFF000u;
+constexpr uint64_t kPage = 4096;
+
+std::mutex gMu;
+std::map<uint32_t, HostDataBlock *> gByKerAddr;  // live blocks by kernel address
+
+uint64_t PageUp(uint64_t n) { return (n + kPage - 1) / kPage * kPage; }
+
+// First gap of the kernel window that holds `size` bytes; 0 when none does.
+uint32_t PlaceKerAddr(uint32_t size) {
+    const uint64_t need = PageUp(size ? size : 1);
+    uint64_t at = kKerBase;
+    for (const auto &[base, block] : gByKerAddr) {
+        if (base >= at + need) break;
+        at = PageUp(static_cast<uint64_t>(base) + (block->size ? block->size : 1));
+    }
+    return at + need <= kKerEnd ? static_cast<uint32_t>(at) : 0;
+}
+
+}  // namespace
 
 extern "C" {
 
@@ -12,39 +49,49 @@ int SysPBA_IO_GPOInitBackUp(void) { return 0; }
 // No update path on a PC: accept and drop the bytes.
 int FW_Write(const unsigned char *, unsigned int size) { return static_cast<int>(size); }
 
-// Data blocks are plain heap buffers; the "kernel address" is the low 32 bits of
-// the user address, which host drivers (the virtual devices) never dereference.
-struct HostDataBlock {
-    void *memory;
-    unsigned int size;
-};
-
 int DBPool_GetSystemPoolID(void) { return 1; }
 
 DataBlockTicket DataBlock_CreateFromPool(int, unsigned int size) {
     auto *b = static_cast<HostDataBlock *>(std::calloc(1, sizeof(HostDataBlock)));
     if (!b) return nullptr;
     b->memory = std::calloc(1, size ? size : 1);
-    if (!b->memory) {
+    b->size = size;
+    std::lock_guard lk(gMu);
+    b->kerAddr = b->memory ? PlaceKerAddr(size) : 0;
+    if (b->kerAddr == 0) {
+        std::free(b->memory);
         std::free(b);
         return nullptr;
     }
-    b->size = size;
+    gByKerAddr[b->kerAddr] = b;
     return b;
 }
 
 void *DataBlock_Access(DataBlockTicket t) { return t ? static_cast<HostDataBlock *>(t)->memory : nullptr; }
 
-uint32_t DataBlock_GetKerVirtAddress(DataBlockTicket t) {
-    return t ? static_cast<uint32_t>(reinterpret_cast<uintptr_t>(static_cast<HostDataBlock *>(t)->memory)) : 0;
-}
+uint32_t DataBlock_GetKerVirtAddress(DataBlockTicket t) { return t ? static_cast<HostDataBlock *>(t)->kerAddr : 0; }
 
 int DataBlock_Deaccess(DataBlockTicket t) { return t ? 0 : -1; }
 
 int DataBlock_ReleaseTicket(DataBlockTicket t) {
     if (!t) return -1;
-    std::free(static_cast<HostDataBlock *>(t)->memory);
-    std::free(t);
+    auto *b = static_cast<HostDataBlock *>(t);
+    {
+        std::lock_guard lk(gMu);
+        gByKerAddr.erase(b->kerAddr);
+    }
+    std::free(b->memory);
+    std::free(b);
     return 0;
+}
+
+void *DataBlock_HostFromKerVirt(uint64_t kerAddr, uint32_t size) {
+    std::lock_guard lk(gMu);
+    auto it = gByKerAddr.upper_bound(kerAddr > 0xFFFFFFFFu ? 0xFFFFFFFFu : static_cast<uint32_t>(kerAddr));
+    if (it == gByKerAddr.begin()) return nullptr;
+    const HostDataBlock *b = std::prev(it)->second;
+    const uint64_t offset = kerAddr - b->kerAddr;
+    if (offset > b->size || size > b->size - offset) return nullptr;
+    return static_cast<char *>(b->memory) + offset;
 }
 }

@@ -4,11 +4,12 @@
 #include "platform/Logger.h"
 
 #define USBADP_LEVEL_ERROR 40000, "ERROR"
+#define USBADP_LEVEL_WARN 30000, "WARN"
 #define USBADP_LEVEL_INFO 20000, "INFO"
 #define USBADP_LEVEL_FINE 10000, "FINE"
 #define USBADP_LEVEL_DEBUG 10000, "DEBUG"
 
-// USBADP_LOG(ERROR|INFO|FINE|DEBUG, format, values...)
+// USBADP_LOG(ERROR|WARN|INFO|FINE|DEBUG, format, values...)
 #define USBADP_LOG(level, ...) \
     Logger_PrintDelay(20000, USBADP_LEVEL_##level, "Unknown", __func__, __VA_ARGS__)
 

@@ -11,6 +11,7 @@
 #include <mutex>
 #include <vector>
 
+#include "usbadapter/maadrivers.h"
 #include "usbadapter/mfpbridge.h"
 
 namespace vdev::detail {
@@ -94,5 +95,13 @@ uint32_t BridgePrnReadTimeout();
 uint32_t BridgeScanReadTimeout();
 int BridgeIoctl(IoctlContext &ctx, unsigned long request, void *arg);
 void BridgeReset();
+
+// The scanner, fax and JBIG codec models (Scanner.cpp, Fax.cpp, Jbig.cpp).
+int ScannerIoctl(IoctlContext &ctx, unsigned long request, void *arg);
+void ScannerReset();
+int FaxIoctl(IoctlContext &ctx, unsigned long request, void *arg);
+void FaxReset();
+int JbigIoctl(IoctlContext &ctx, unsigned long request, void *arg);
+void JbigReset();
 
 }  // namespace vdev::detail

@@ -40,6 +40,10 @@ namespace {
 constexpr NodeModel kNodes[] = {
     {MS_PRN_FILE_NAME, BridgePrnReadTimeout, BridgeIoctl, BridgeReset, true},
     {MS_SCAN_FILE_NAME, BridgeScanReadTimeout, BridgeIoctl, BridgeReset, true},
+    {SCAN_DEVICE_NAME, nullptr, ScannerIoctl, ScannerReset, false},
+    {FAX_DEVICE_NAME, nullptr, FaxIoctl, FaxReset, false},
+    {JBIG_ENC_DEVICE_NAME, nullptr, JbigIoctl, JbigReset, false},
+    {JBIG_DEC_DEVICE_NAME, nullptr, JbigIoctl, JbigReset, false},
 };
 constexpr int kNodeCount = static_cast<int>(std::size(kNodes));
 static_assert(kNodeCount < 255);
@@ -199,6 +203,7 @@ struct NodeState {
     std::vector<int> pollTimeouts;
     std::vector<size_t> readSizes;
     size_t pollCalls = 0, readCalls = 0;
+    size_t opens = 0;  // successful opens
     size_t expiredPolls = 0;  // polls that returned 0
     std::vector<int> openFds;  // oldest first
     int lastFlags = 0;
@@ -425,6 +430,7 @@ int Open(int node, int flags) {
     uint32_t gen = Generation(node);
     m.fds[fd] = FdState{node, gen, flags & O_ACCMODE, flags & kOpenStatusFlags, 0};
     n.openFds.push_back(fd);
+    ++n.opens;
     n.lastFlags = flags & kOpenStatusFlags;
     gFdTable[fd].store((gen << 8) | static_cast<uint32_t>(node + 1), std::memory_order_release);
     return fd;
@@ -665,6 +671,7 @@ void Reset() {
             n.pollTimeouts.clear();
             n.readSizes.clear();
             n.pollCalls = n.readCalls = 0;
+            n.opens = 0;
             n.expiredPolls = 0;
             n.openFds.clear();
             n.lastFlags = 0;
@@ -689,6 +696,12 @@ int OpenCount(const char *path) {
     int i = NodeIndex(path);
     std::lock_guard lk(M().mu);
     return static_cast<int>(M().nodes[i].openFds.size());
+}
+
+size_t Opens(const char *path) {
+    int i = NodeIndex(path);
+    std::lock_guard lk(M().mu);
+    return M().nodes[i].opens;
 }
 
 void HostWrite(const char *path, const void *data, size_t size) {

@@ -40,13 +40,18 @@
 #include <string>
 #include <vector>
 
+#include "usbadapter/maadrivers.h"
 #include "usbadapter/mfpbridge.h"
 
 namespace vdev {
 
-// Node paths the model knows. Later models (scanner, fax, JBIG) add their own.
+// Node paths the model knows.
 inline constexpr const char *kPrn = MS_PRN_FILE_NAME;
 inline constexpr const char *kScan = MS_SCAN_FILE_NAME;
+inline constexpr const char *kScanner = SCAN_DEVICE_NAME;
+inline constexpr const char *kFax = FAX_DEVICE_NAME;
+inline constexpr const char *kJbigEnc = JBIG_ENC_DEVICE_NAME;
+inline constexpr const char *kJbigDec = JBIG_DEC_DEVICE_NAME;
 
 // Driver time-outs before any IOCNR_SET_MFP_TO (and after Reset), in ms.
 inline constexpr mfp_to_t kInitialTimeouts = {5000, 5000, 5000, 5000};
@@ -66,6 +71,8 @@ void Reset();
 void SetPresent(const char *path, bool present);
 // Number of descriptors currently open on the node.
 int OpenCount(const char *path);
+// Successful opens of the node since Reset().
+size_t Opens(const char *path);
 
 // ---- host side -----------------------------------------------------------
 // One host transfer: the library's read() returns at most one transfer's bytes
@@ -159,5 +166,49 @@ void ForceStatusFlags(const char *path, int flags);
 
 // Make the next `count` ioctls with `request` on the node fail with `err`.
 void FailIoctl(const char *path, unsigned long request, int err, int count = 1);
+
+// ---- scanner driver (/dev/scanner) ----------------------------------------------
+// IOCNR_SCAN_APP_LOCK returns the queued answers, oldest first, then the
+// default (SCAN_APP_LOCK_TAKEN after Reset). Answer 1 takes the lock;
+// IOCNR_SCAN_APP_LOCK_RELEASE drops it.
+void QueueScanLockAnswers(const std::vector<int> &answers);
+void SetScanLockDefault(int answer);
+bool ScanLocked();
+// How IOC_MAA_TEST answers (every call, until changed; Reset: empty response).
+// The response is written into the caller's data block found through its
+// kernel address (bufphys), at most bufsize bytes; an address that is not a
+// live block fails the call with EFAULT. `result` is what the driver reports
+// (default: the response size; it may exceed the buffer). `status` >= 0 is the
+// ioctl's return value; < 0 fails the call with errno -status.
+struct ScanTestAnswer {
+    std::vector<uint8_t> response;
+    std::optional<uint32_t> result;
+    uint32_t success = 1;
+    int status = 0;
+};
+void SetScanTestAnswer(const ScanTestAnswer &answer);
+// Command lines IOC_MAA_TEST received, in order (the record: Ioctls()).
+std::vector<std::string> ScanCommands();
+// What IOC_ADF_MECHA_TYPE and IOC_ADF_MULTI_MECHA_TYPE answer (Reset: zeros).
+void SetADFMecha(uint32_t type, uint32_t version, uint32_t multiType);
+
+// ---- fax driver (/dev/fax) --------------------------------------------------------
+// How IOCNR_FAX_MAA_TEST answers: the response text (cut to the record's
+// FAX_MAA_RESPONSE_LENGTH), `result` (default: the bytes copied), `success`,
+// and `status` as for the scanner.
+struct FaxTestAnswer {
+    std::string response;
+    std::optional<uint32_t> result;
+    uint32_t success = 1;
+    int status = 0;
+};
+void SetFaxTestAnswer(const FaxTestAnswer &answer);
+std::vector<std::string> FaxCommands();
+
+// ---- JBIG codec (/dev/jbigenc, /dev/jbigdec) -------------------------------------
+// ulStatus that JBIG_IOC_SELFTEST answers on the node (Reset: 0, a pass), and
+// the number of JBIG_IOC_RESET calls it received.
+void SetJbigSelfTestStatus(const char *path, uint32_t status);
+int JbigResets(const char *path);
 
 }  // namespace vdev

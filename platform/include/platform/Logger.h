@@ -6,7 +6,7 @@
 extern "C" {
 #endif
 
-/* module, level number (40000 ERROR, 20000 INFO, 10000 FINE/DEBUG), level name,
+/* module, level number (40000 ERROR, 30000 WARN, 20000 INFO, 10000 FINE/DEBUG), level name,
  * component, calling function, printf format and values. */
 void Logger_PrintDelay(int module, int level, const char *levelName, const char *component,
                        const char *function, const char *format, ...)

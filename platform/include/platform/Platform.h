@@ -24,6 +24,11 @@ uint32_t DataBlock_GetKerVirtAddress(DataBlockTicket ticket);
 int DataBlock_Deaccess(DataBlockTicket ticket);
 int DataBlock_ReleaseTicket(DataBlockTicket ticket);
 
+/* Host stand-in only (the virtual drivers' side of the map): the memory behind
+ * [kerAddr, kerAddr + size) of a live block, NULL when the range is not inside
+ * one block or the block has been released. */
+void *DataBlock_HostFromKerVirt(uint64_t kerAddr, uint32_t size);
+
 #ifdef __cplusplus
 }
 #endif

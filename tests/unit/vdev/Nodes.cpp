@@ -24,6 +24,8 @@ TEST_F(Nodes, AbsentNodeFailsToOpenWithEnoent) {
     EXPECT_TRUE(prn) << "the other node is still there";
     vdev::SetPresent(vdev::kScan, true);
     EXPECT_TRUE(Open(vdev::kScan));
+    EXPECT_TRUE(Open(vdev::kScan));
+    EXPECT_EQ(vdev::Opens(vdev::kScan), 2u) << "only successful opens count, closed ones included";
 }
 
 TEST_F(Nodes, ForeignDescriptorsAreUntouched) {

@@ -1,0 +1,148 @@
+// The fax-side test functions and the JBIG codec test as the host and the
+// drivers see them: the command line on the fax driver, the scanner lock held
+// around it where the test needs the scanner side, and the records written.
+#include <cstring>
+#include <functional>
+
+#include "maa/functions/MAA_FaxJbig.h"
+#include "maa/functions/MAA_ScanDriver.h"
+#include "maa_functions/DriverFixture.h"
+#include "usbadapter/maadrivers.h"
+
+using namespace drivertest;
+
+namespace {
+
+using FaxJbig = DriverTest;
+
+struct FaxCase {
+    std::function<TMAAResult *()> call;
+    std::string name, line;
+    bool scannerLock;
+};
+
+const std::vector<FaxCase> &FaxCases() {
+    static const std::vector<FaxCase> cases = {
+        {[] { return SetSpeakerTest(2); }, "SetSpeakerTest", "SetSpeakerTest(2)", false},
+        {[] { return SysPBA_IO_Fax_GPITest(1, 2, 3); }, "SysPBA_IO_Fax_GPITest", "SysPBA_IO_Fax_GPITest(1,2,3)", true},
+        {[] { return SysPBA_IO_Fax_GPOTest(1, 0, 0xFFFFFFFFu, 4); }, "SysPBA_IO_Fax_GPOTest",
+         "SysPBA_IO_Fax_GPOTest(1,0,4294967295,4)", true},
+        {[] { return PhoneTest_OHD(1, 2, 3); }, "PhoneTest_OHD", "PhoneTest_OHD(1,2,3)", true},
+        {[] { return PhoneTest_Dial(5, 5, 5); }, "PhoneTest_Dial", "PhoneTest_Dial(5,5,5)", true},
+        {[] { return PhoneTest_Ring(0, 1); }, "PhoneTest_Ring", "PhoneTest_Ring(0,1)", true},
+        {[] { return UART_Test_FAX(9600, 8, 0, 1); }, "UART_Test_FAX", "UART_Test_FAX(9600,8,0,1)", true},
+        {[] { return FaxModuleDetect_To_SCB(); }, "FaxModuleDetect_To_SCB", "FaxModuleDetect_To_SCB()", false},
+    };
+    return cases;
+}
+
+TEST_F(FaxJbig, EachFaxFunctionSendsItsLineAndWritesHeaderAndResponse) {
+    for (const FaxCase &c : FaxCases()) {
+        SCOPED_TRACE(c.line);
+        Restart();
+        vdev::SetFaxTestAnswer({"LINE OK", std::nullopt, 1, 0});
+        c.call();
+        EXPECT_EQ(vdev::FaxCommands(), std::vector<std::string>{c.line});
+        EXPECT_EQ(records, (std::vector<Record>{Cont("[ " + c.name + " ]"), End1("LINE OK")}));
+        const std::vector<unsigned long> expected =
+            c.scannerLock ? std::vector<unsigned long>{IOCNR_SCAN_APP_LOCK, IOCNR_SCAN_APP_LOCK_RELEASE}
+                          : std::vector<unsigned long>{};
+        EXPECT_EQ(Requests(vdev::kScanner), expected);
+        EXPECT_EQ(vdev::Opens(vdev::kScanner), c.scannerLock ? 1u : 0u);
+        EXPECT_EQ(vdev::OpenCount(vdev::kScanner) + vdev::OpenCount(vdev::kFax), 0);
+        EXPECT_EQ(fdFaxDrv, -1);
+        EXPECT_EQ(fdScnDrv, -1);
+    }
+}
+
+TEST_F(FaxJbig, WithoutAResponseTextTheVerdictFollowsTheDriversSuccess) {
+    struct Case {
+        vdev::FaxTestAnswer answer;
+        Record last;
+    } cases[] = {
+        {{"", std::nullopt, 1, 0}, End1("PhoneTest_Ring DONE")},
+        {{"", std::nullopt, 0, 0}, End0("PhoneTest_Ring FAIL")},
+        {{"NO DIAL TONE", std::nullopt, 0, 0}, End0("NO DIAL TONE")},
+        // The count bounds the text; a count past the record is cut to it.
+        {{"RING 3 TIMES", 6u, 1, 0}, End1("RING 3")},
+        {{std::string(1500, 'r'), 0xFFFFFFFFu, 1, 0}, End1(std::string(FAX_MAA_RESPONSE_LENGTH, 'r'))},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.last.data);
+        Restart();
+        vdev::SetFaxTestAnswer(c.answer);
+        PhoneTest_Ring(1, 1);
+        ASSERT_EQ(records.size(), 2u);
+        EXPECT_EQ(records[1], c.last);
+    }
+}
+
+TEST_F(FaxJbig, FailedStepsAreNamedAndTheLockIsNeverLeftHeld) {
+    struct Case {
+        std::function<void()> script;
+        std::string text;
+        size_t lockAttempts, releases, faxCalls;
+    } cases[] = {
+        {[] { vdev::SetPresent(vdev::kScanner, false); }, "critical error! failed to open scan device", 0, 0, 0},
+        {[] { vdev::SetScanLockDefault(0); }, "scanner is busy or in sleep", 31, 0, 0},
+        {[] { vdev::SetPresent(vdev::kFax, false); }, "critical error! failed to open fax device", 1, 1, 0},
+        {[] { vdev::SetFaxTestAnswer({"x", std::nullopt, 1, 4}); }, "critical error! failed to control fax device", 1, 1,
+         1},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.text);
+        Restart();
+        c.script();
+        PhoneTest_OHD(1, 2, 3);
+        EXPECT_EQ(records, (std::vector<Record>{Cont("[ PhoneTest_OHD ]"), End0(c.text)}));
+        const std::vector<unsigned long> req = Requests(vdev::kScanner);
+        EXPECT_EQ(CountOf(req, IOCNR_SCAN_APP_LOCK), c.lockAttempts);
+        EXPECT_EQ(CountOf(req, IOCNR_SCAN_APP_LOCK_RELEASE), c.releases);
+        EXPECT_EQ(vdev::FaxCommands().size(), c.faxCalls);
+        EXPECT_FALSE(vdev::ScanLocked());
+        EXPECT_EQ(sleeps.size(), c.lockAttempts ? c.lockAttempts - 1 : 0);
+    }
+}
+
+TEST_F(FaxJbig, TheSpeakerTestNeedsNoScanner) {
+    vdev::SetPresent(vdev::kScanner, false);
+    vdev::SetFaxTestAnswer({"", std::nullopt, 1, 0});
+    SetSpeakerTest(1);
+    EXPECT_EQ(records.back(), End1("SetSpeakerTest DONE"));
+}
+
+TEST_F(FaxJbig, HWJBIGTestChecksEncoderThenDecoder) {
+    struct Case {
+        std::function<void()> script;
+        std::string verdict;
+        int decoderResets;
+    } cases[] = {
+        {[] {}, "HWJBIG TEST DONE", 1},
+        {[] { vdev::SetJbigSelfTestStatus(vdev::kJbigDec, 9); }, "JBIG Decoder = NG", 1},
+        {[] { vdev::SetJbigSelfTestStatus(vdev::kJbigEnc, 1); }, "JBIG Encoder = NG", 0},
+        {[] { vdev::SetPresent(vdev::kJbigEnc, false); }, "Open /dev/jbigenc Fails", 0},
+        {[] { vdev::SetPresent(vdev::kJbigDec, false); }, "Open /dev/jbigdec Fails", 0},
+        {[] { vdev::FailIoctl(vdev::kJbigEnc, JBIG_IOC_RESET, EIO); }, "JBIG Encoder Reset Fails", 0},
+        {[] { vdev::FailIoctl(vdev::kJbigDec, JBIG_IOC_SELFTEST, EIO); }, "JBIG Decoder Self Test Fails", 1},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.verdict);
+        Restart();
+        c.script();
+        TMAAResult *r = HWJBIGTest(5);
+        EXPECT_EQ(records, std::vector<Record>{Cont("[ HWJBIGTest : Argument=5 ]")});
+        EXPECT_EQ(Returned(r), End1(c.verdict));  // the shell writes it
+        EXPECT_EQ(vdev::JbigResets(vdev::kJbigDec), c.decoderResets);
+        EXPECT_EQ(vdev::OpenCount(vdev::kJbigEnc) + vdev::OpenCount(vdev::kJbigDec), 0);
+    }
+    Restart();
+    HWJBIGTest(7);
+    std::vector<vdev::IoctlCall> calls = vdev::Ioctls(vdev::kJbigDec);
+    ASSERT_EQ(calls.size(), 2u);
+    TJBIGSelfTest sent;
+    ASSERT_EQ(calls[1].payload.size(), sizeof sent);
+    std::memcpy(&sent, calls[1].payload.data(), sizeof sent);
+    EXPECT_EQ(sent.ulPattern, 7u);
+}
+
+}  // namespace
