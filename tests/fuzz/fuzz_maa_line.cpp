@@ -16,6 +16,7 @@
 #include "maa/MAA_IF.h"
 #include "maa/MAA_Parser.h"
 #include "maa/MAA_Symbol.h"
+#include "maa/functions/MAA_Panel.h"
 #include "maa/functions/MAA_SysResult.h"
 #include "vdev.h"
 #include "ShellProbes.h"
@@ -40,6 +41,7 @@ extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     MAA_SetResultWriter(&consume);
     MAA_SetCommandRunner(&recordCommand);
     MAA_SetSleeper(&noPause);
+    MAA_PanelSetWaits(10, 10, 10);  // no UI server answers here
     // The vocabulary's fixed paths would otherwise reach this machine's own
     // /proc and /etc.
     static char root[] = "/tmp/usbadapter-fuzz-XXXXXX";

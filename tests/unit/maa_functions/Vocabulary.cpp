@@ -1,18 +1,25 @@
 // Calling the registered vocabulary through the shell the way a host script
 // does: the call contract, the dump, the forwarded families, and every name
 // called with hostile arguments.
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <gtest/gtest.h>
 
 #include <algorithm>
 #include <string>
 #include <vector>
 
+#include "adapter/USB.h"
+#include "common/ByteOrder.h"
 #include "maa/MAA_Hook.h"
 #include "maa/ShellFixture.h"
 #include "maa/functions/MAA_Forwarded.h"
+#include "maa/functions/MAA_Panel.h"
 #include "maa/functions/MAA_SysResult.h"
 #include "support/TempRoot.h"
 #include "vdev.h"
+#include "vendor/VLX_Main.h"
 
 namespace maatest {
 namespace {
@@ -34,11 +41,13 @@ protected:
         pauses.clear();
         MAA_SetCommandRunner(&recordCommand);
         MAA_SetSleeper(&recordPause);
+        MAA_PanelSetWaits(50, 50, 50);  // no UI server answers here
         MAA_SymbolReg();
     }
     void TearDown() override {
         MAA_SetCommandRunner(nullptr);
         MAA_SetSleeper(nullptr);
+        MAA_PanelSetWaits(0, 0, 0);
         ShellTest::TearDown();
     }
     static std::vector<std::string> texts() {
@@ -94,6 +103,31 @@ TEST_F(Vocabulary, AForwardedFamilyReportsItsHeaderAndFailsWithoutTheJavaService
     EXPECT_EQ(records[0].enContinue, MAA_RESULT_CONTINUE);
     EXPECT_EQ(records[1].data, "Failed");
     EXPECT_EQ(records[1].enContinue, MAA_RESULT_END);
+}
+
+TEST_F(Vocabulary, TheTonerSensorNameReachesTheEngineInterfaceNotItsFirstRegistration) {
+    ASSERT_EQ(run("Get_TonerSensorStatus(1)"), 0u);
+    ASSERT_FALSE(records.empty());
+    EXPECT_EQ(records[0].data, "[ Get_TonerSensorStatus ]");  // "[ GetTonerSensorStatus ]" is the superseded one
+    EXPECT_TRUE(LoggerHost_Contains("[Eng_MaaStrNormalTest] Start===>"));
+}
+
+TEST_F(Vocabulary, AScannerSideNameWritesItsOneResultItselfAndTheShellAddsNone) {
+    const int channel = ::open(vdev::kPrn, O_RDWR);
+    ASSERT_GT(channel, 0);
+    ulDrvHandle = static_cast<U32>(channel);
+    std::string frame(12, '\0');
+    WriteBE32(reinterpret_cast<U8 *>(frame.data()), MAA_RESULT_END);
+    WriteBE32(reinterpret_cast<U8 *>(frame.data()) + 4, 1);
+    WriteBE32(reinterpret_cast<U8 *>(frame.data()) + 8, 7);
+    frame += "Motor=1";
+    vdev::SetScanTestAnswer({std::vector<uint8_t>(frame.begin(), frame.end()), std::nullopt, 1, 0});
+    EXPECT_EQ(run("ScanMotorTest(1)"), 0u);
+    const std::vector<uint8_t> wire = vdev::HostRead(vdev::kPrn);
+    EXPECT_EQ(std::string(wire.begin(), wire.end()), frame);
+    EXPECT_TRUE(records.empty());
+    EXPECT_EQ(vdev::ScanCommands(), std::vector<std::string>{"ScanMotorTest(1)"});
+    ::close(channel);
 }
 
 TEST_F(Vocabulary, DelayPausesForItsArgumentUpToAMinute) {
