@@ -22,7 +22,7 @@ status=$?
 cat "$dir/sim.txt"
 [ $status -eq 0 ] || fail "scripted session: exit status $status"
 grep -q '"event":"shell-put","bytes":38,' "$dir/out/session.jsonl" || fail "no download in the journal"
-[ "$(grep -c '"event":"shell-record"' "$dir/out/session.jsonl")" -eq 8 ] || fail "not 8 records in the journal"
+[ "$(grep -c '"event":"shell-record"' "$dir/out/session.jsonl")" -eq 46 ] || fail "not 46 records in the journal"
 
 # The host tool on the simulator's print channel: plain open/read/write.
 "$sim" --out "$dir/out2" --timeout 8000 -e "pty prn $dir/prn" -e "expect-jobs 0" >"$dir/sim2.txt" 2>&1 &
@@ -72,6 +72,36 @@ grep -qx "usbadapter-shell: 2 blank lines dropped from the auto script (the devi
     "$dir/auto-err.txt" || fail "no note of the dropped blank lines"
 dumps=$(grep -c "File Dump Start" "$dir/out3/usbadapter.log")
 [ "$dumps" -eq 2 ] || fail "the auto run dumped $dumps times, not 2"
+
+# A factory script with one test function of each family (simulated drivers,
+# UI server and Java service); the host side decodes every record.
+factory=$(dirname "$0")/../../tools/sim/samples/factory.sim
+"$sim" --out "$dir/out4" --timeout 8000 --script "$factory" >"$dir/sim4.txt" 2>&1
+status=$?
+cat "$dir/sim4.txt"
+[ $status -eq 0 ] || fail "factory session: exit status $status"
+grep -q '"method":"runUsbFunctionCall","arg":"Pattern_Print(1,2)"' "$dir/out4/journal.jsonl" ||
+    fail "the forwarded family did not reach the Java service"
+grep -q '"method":"maaEngMaaStrNormalTest","arg":"Get_TonerSensorStatus(1)"' "$dir/out4/journal.jsonl" ||
+    fail "the engine interface did not reach the Java service"
+grep -q '^echo start > .*/proc/cpufantest$' "$dir/out4/commands.log" || fail "the fan test's command was not recorded"
+
+# The host tool lists the vocabulary on the simulator's print channel.
+"$sim" --out "$dir/out5" --timeout 8000 -e "pty prn $dir/prn" -e "expect-jobs 0" >"$dir/sim5.txt" 2>&1 &
+pid=$!
+i=0
+while [ ! -L "$dir/prn" ]; do
+    i=$((i + 1))
+    [ $i -lt 400 ] || fail "the simulator made no pseudo-terminal (symbol dump)"
+    sleep 0.05
+done
+"$tool" -w 300 -e 'MAA_SymbolDump()' "$dir/prn" >"$dir/tool5.txt" 2>&1
+status=$?
+wait $pid
+cat "$dir/tool5.txt"
+[ $status -eq 0 ] || fail "usbadapter-shell (symbol dump): exit status $status"
+[ "$(grep -c '^|    ' "$dir/tool5.txt")" -eq 38 ] || fail "the dump did not list 38 names"
+grep -q "The Number Of Symbol : 38" "$dir/tool5.txt" || fail "the dump did not count 38 names"
 
 rm -rf "$dir"
 echo "PASS"

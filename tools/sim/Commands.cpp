@@ -14,6 +14,7 @@
 #include "Sha256.h"
 #include "ShellCommands.h"
 #include "UiPeer.h"
+#include "common/ByteOrder.h"
 #include "usbadapter/mfpbridge.h"
 #include "vdev.h"
 
@@ -517,6 +518,26 @@ bool UiServer(Session &s, const Args &a, std::string *error) {
     return true;
 }
 
+// The scanner driver answers every scanner-side test with one final result
+// frame holding TEXT (result 1), the way the scanner firmware reports a test.
+bool ScannerAnswer(Session &s, const Args &a, std::string *) {
+    std::vector<uint8_t> frame(12, 0);
+    WriteBE32(frame.data(), 1);
+    WriteBE32(frame.data() + 4, 1);
+    WriteBE32(frame.data() + 8, static_cast<uint32_t>(a[0].size()));
+    frame.insert(frame.end(), a[0].begin(), a[0].end());
+    vdev::SetScanTestAnswer({frame, std::nullopt, 1, 0});
+    s.Sim(JsonLine("scanner-answer").Str("text", a[0]));
+    return true;
+}
+
+// The fax driver answers every fax-side test with TEXT.
+bool FaxAnswer(Session &s, const Args &a, std::string *) {
+    vdev::SetFaxTestAnswer({a[0], std::nullopt, 1, 0});
+    s.Sim(JsonLine("fax-answer").Str("text", a[0]));
+    return true;
+}
+
 const std::vector<Command> kCommands = {
     {"plug", "",
      "the host configures the device (MFP_DEV_CONFIGURED); the first time, waits until the print reader reads", 0, 0,
@@ -570,6 +591,9 @@ const std::vector<Command> kCommands = {
      "starts the operator panel's UI server on 127.0.0.1, answering every panel test with ANSWER (e.g. 9); stop "
      "ends it and journals the requests it received",
      1, 1, nullptr, UiServer},
+    {"scanner-answer", "TEXT", "the scanner driver answers every scanner-side test with one final record TEXT", 1, 1,
+     nullptr, ScannerAnswer},
+    {"fax-answer", "TEXT", "the fax driver answers every fax-side test with TEXT", 1, 1, nullptr, FaxAnswer},
 };
 
 }  // namespace

@@ -53,10 +53,14 @@ bool WaitUntil(const std::function<bool()> &done, int timeoutMs) {
 size_t PollCount(const char *path) { return vdev::PollTimeouts(path).size(); }
 
 bool ReaderWaiting(pid_t reader, const char *path) {
-    if (reader <= 0 || vdev::PendingHostBytes(path) != 0 || ProbeThread(reader) != ThreadWait::Poll) return false;
+    // In poll, and on the node: a test function polling a socket is busy.
+    if (reader <= 0 || vdev::PendingHostBytes(path) != 0 || ProbeThread(reader) != ThreadWait::Poll ||
+        vdev::PollsInProgress(path) == 0)
+        return false;
     size_t polls = PollCount(path);
     std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    return vdev::PendingHostBytes(path) == 0 && ProbeThread(reader) == ThreadWait::Poll && PollCount(path) == polls;
+    return vdev::PendingHostBytes(path) == 0 && ProbeThread(reader) == ThreadWait::Poll && PollCount(path) == polls &&
+           vdev::PollsInProgress(path) != 0;
 }
 
 bool NotifyAndWait(const char *path, uint8_t code, int32_t forWhom, int timeoutMs) {

@@ -203,6 +203,7 @@ struct NodeState {
     std::vector<int> pollTimeouts;
     std::vector<size_t> readSizes;
     size_t pollCalls = 0, readCalls = 0;
+    int pollsInProgress = 0;  // survives Reset: a poll may be under way
     size_t opens = 0;  // successful opens
     size_t expiredPolls = 0;  // polls that returned 0
     std::vector<int> openFds;  // oldest first
@@ -630,7 +631,15 @@ int Poll(struct pollfd *fds, nfds_t count, int timeout) {
             ++m.nodes[node].pollCalls;
         }
     }
+    {
+        std::lock_guard lk(m.mu);
+        for (int node : nodes) ++m.nodes[node].pollsInProgress;
+    }
     int r = PollNodes(fds, count, timeout, nodes);
+    {
+        std::lock_guard lk(m.mu);
+        for (int node : nodes) --m.nodes[node].pollsInProgress;
+    }
     if (r == 0 && timeout != 0) {
         std::lock_guard lk(m.mu);
         for (int node : nodes) ++m.nodes[node].expiredPolls;
@@ -841,6 +850,12 @@ size_t PollCalls(const char *path) {
     int i = NodeIndex(path);
     std::lock_guard lk(M().mu);
     return M().nodes[i].pollCalls;
+}
+
+int PollsInProgress(const char *path) {
+    int i = NodeIndex(path);
+    std::lock_guard lk(M().mu);
+    return M().nodes[i].pollsInProgress;
 }
 
 size_t ExpiredPolls(const char *path) {

@@ -122,6 +122,8 @@ std::vector<size_t> ReadSizes(const char *path);
 // above (a waiter can compare them safely).
 size_t PollCalls(const char *path);
 size_t ReadCalls(const char *path);
+// Polls on the node under way right now (a thread blocked in poll on it).
+int PollsInProgress(const char *path);
 // Polls on the node that ended in a time-out (real or virtual) since Reset().
 size_t ExpiredPolls(const char *path);
 
