@@ -490,7 +490,10 @@ std::unique_ptr<uipeer::Server> uiServer;
 bool UiServer(Session &s, const Args &a, std::string *error) {
     if (uiServer) {
         std::string requests;
-        for (const std::string &r : uiServer->requests()) requests += (requests.empty() ? "" : " ") + Hex(r);
+        for (const std::string &r : uiServer->requests()) {
+            if (!requests.empty()) requests += ' ';
+            requests += Hex(r);
+        }
         uiServer.reset();
         s.Sim(JsonLine("ui-server").Str("state", "stopped").Str("requests", requests));
     }

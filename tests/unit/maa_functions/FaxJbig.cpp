@@ -57,20 +57,23 @@ TEST_F(FaxJbig, EachFaxFunctionSendsItsLineAndWritesHeaderAndResponse) {
 
 TEST_F(FaxJbig, WithoutAResponseTextTheVerdictFollowsTheDriversSuccess) {
     struct Case {
-        vdev::FaxTestAnswer answer;
+        std::string response;
+        std::optional<uint32_t> result;
+        uint32_t success;
         Record last;
-    } cases[] = {
-        {{"", std::nullopt, 1, 0}, End1("PhoneTest_Ring DONE")},
-        {{"", std::nullopt, 0, 0}, End0("PhoneTest_Ring FAIL")},
-        {{"NO DIAL TONE", std::nullopt, 0, 0}, End0("NO DIAL TONE")},
+    };
+    const std::vector<Case> cases = {
+        {"", std::nullopt, 1, End1("PhoneTest_Ring DONE")},
+        {"", std::nullopt, 0, End0("PhoneTest_Ring FAIL")},
+        {"NO DIAL TONE", std::nullopt, 0, End0("NO DIAL TONE")},
         // The count bounds the text; a count past the record is cut to it.
-        {{"RING 3 TIMES", 6u, 1, 0}, End1("RING 3")},
-        {{std::string(1500, 'r'), 0xFFFFFFFFu, 1, 0}, End1(std::string(FAX_MAA_RESPONSE_LENGTH, 'r'))},
+        {"RING 3 TIMES", 6u, 1, End1("RING 3")},
+        {std::string(1500, 'r'), 0xFFFFFFFFu, 1, End1(std::string(FAX_MAA_RESPONSE_LENGTH, 'r'))},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.last.data);
         Restart();
-        vdev::SetFaxTestAnswer(c.answer);
+        vdev::SetFaxTestAnswer({c.response, c.result, c.success, 0});
         PhoneTest_Ring(1, 1);
         ASSERT_EQ(records.size(), 2u);
         EXPECT_EQ(records[1], c.last);

@@ -157,22 +157,24 @@ TEST_F(PanelTest, WithoutAnAnswerTheHeaderIsTheLastRecord) {
     struct Case {
         const char *name;
         Call call;
-        uipeer::Step step;
+        std::string answer;  // what the server sends back ("": nothing)
+        bool hold;           // keeps the connection open without answering
         std::string header;
-    } cases[] = {
-        {"closed at once", UISSM_IF_Key_WaitTest_And_Cli, {}, "[ UISSM_IF_Key_WaitTest ]"},
-        {"closed at once, key sound", [] { return UISSM_MAA_Set_KeySound_And_Cli(0); }, {},
+    };
+    const std::vector<Case> cases = {
+        {"closed at once", UISSM_IF_Key_WaitTest_And_Cli, "", false, "[ UISSM_IF_Key_WaitTest ]"},
+        {"closed at once, key sound", [] { return UISSM_MAA_Set_KeySound_And_Cli(0); }, "", false,
          "[ UISSM_MAA_Set_KeySound : Argument = 0 ]"},
         // Neither on nor off: answers are read past until the server closes.
-        {"key sound 2 answered", [] { return UISSM_MAA_Set_KeySound_And_Cli(2); }, {"9"},
+        {"key sound 2 answered", [] { return UISSM_MAA_Set_KeySound_And_Cli(2); }, "9", false,
          "[ UISSM_MAA_Set_KeySound : Argument = 2 ]"},
         // No answer within the answer wait.
-        {"silent server", SPI_Get_UI, {"", true}, "[ SPI_Get_UI ]"},
+        {"silent server", SPI_Get_UI, "", true, "[ SPI_Get_UI ]"},
     };
     MAA_PanelSetWaits(2000, 2000, 100);
     for (const Case &c : cases) {
         SCOPED_TRACE(c.name);
-        uipeer::Server server(uipeer::Scripted({c.step}));
+        uipeer::Server server(uipeer::Scripted({uipeer::Step{c.answer, c.hold}}));
         ASSERT_TRUE(server.ok());
         usePort(server.port());
         const auto start = std::chrono::steady_clock::now();
