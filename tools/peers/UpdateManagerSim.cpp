@@ -337,6 +337,7 @@ bool UpdateManagerSim::serveEnd(int fd) {
     if (m == UmMisbehaviour::Silence) return false;
     if (!writeAll(fd, "$PRO", 4)) return false;
     std::vector<int8_t> steps = opt_.progress;
+    if (steps.empty()) steps = {10, 40, 70, 100};
     if (m == UmMisbehaviour::ProgressFail) steps = {30, -1};
     for (int8_t p : steps) {
         if (m == UmMisbehaviour::SlowProgress) {

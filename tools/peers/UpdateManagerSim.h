@@ -50,7 +50,7 @@ struct UmOptions {
     UmMisbehaviour misbehaviour = UmMisbehaviour::None;
     int ioTimeoutMs = 10000;    // a connection silent this long is dropped
     int slowProgressMs = 300;
-    std::vector<int8_t> progress = {10, 40, 70, 100};
+    std::vector<int8_t> progress;  // reported after "$END"; empty: 10, 40, 70, 100
 };
 
 class UpdateManagerSim {
