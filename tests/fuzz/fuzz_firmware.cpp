@@ -51,9 +51,8 @@ std::vector<std::string> Split(std::string_view s, std::string_view sep) {
 int g_listen = -1;
 
 void Setup() {
-    char tmpl[] = "/tmp/usbadapter-fuzz-fw-XXXXXX";
-    if (!::mkdtemp(tmpl)) fail("no working directory");
-    std::filesystem::current_path(tmpl);
+    // fw.bin lands in the working directory; libFuzzer's paths are relative
+    // to it, so it stays as it is.
     ::setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
     g_listen = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
     sockaddr_in a{};
@@ -127,6 +126,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     done = true;
     manager.join();
     ::close(fd);
+    vdev::Reset();  // the host ends of the node
     if (r < -1 || r > FW_PJL_HEADER_SIZE) fail("result outside -1..80");
     if (firmware != 0 && firmware != 1) fail("firmware flag neither 0 nor 1");
     if (firmware == 0 && r == 0) fail("success without firmware");
