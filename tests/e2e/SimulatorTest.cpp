@@ -345,4 +345,60 @@ TEST_F(Simulator, JobContentOrReadBackOtherThanExpectedFails) {
     EXPECT_NE(output_.find("cannot read"), std::string::npos);
 }
 
+// ---- firmware: the update manager on loopback -------------------------------------
+
+std::string ManagerFile(const std::string &out, int k, int type) {
+    char name[64];
+    std::snprintf(name, sizeof name, "/update-manager/image-%03d-type%d.bin", k, type);
+    return out + name;
+}
+
+#ifdef USBADAPTER_FW
+// The host tool packs the file; the host sends it as a driver would, each
+// header and each body a transfer of its own.
+TEST_F(Simulator, TwoImagesOfSixtyFourMebibytesReachTheManagerIntact) {
+    const std::string a = PrintData(40u << 20, 21), b = PrintData(24u << 20, 22);
+    WriteFile(Path("scan.img"), a);
+    WriteFile(Path("rootfs.img"), b);
+    const std::string cmd = std::string(USBADAPTER_FW) + " -q -o " + Path("fw.pkg") + " - E7=" + Path("scan.img") +
+                            " EC3=" + Path("rootfs.img");
+    ASSERT_EQ(std::system(cmd.c_str()), 0);
+    ASSERT_EQ(fs::file_size(Path("fw.pkg")), 160 + a.size() + b.size());
+
+    ASSERT_EQ(RunScript("fw-manager\nsend prn file:fw.pkg chunks 80," + std::to_string(a.size()) +
+                        ",80\nfw-expect-images 2 ends 1\nfw-expect-image 1 type 1 checksum ok sha256 " +
+                        sim::Sha256Hex(a) + "\nfw-expect-image 2 type 15 checksum ok sha256 " + sim::Sha256Hex(b) +
+                        "\nsend prn sample\nexpect-jobs 1\nexpect-job 1 equals sample\n"),
+              0);
+    EXPECT_EQ(ReadFile(ManagerFile(dir_ + "/out", 1, 1)), a);
+    EXPECT_EQ(ReadFile(ManagerFile(dir_ + "/out", 2, 15)), b);
+    const std::string log = ReadFile(Out("usbadapter.log"));
+    EXPECT_NE(log.find("[USBAdp] Firmware download success"), std::string::npos);
+    // The firmware file itself never reached the print service.
+    EXPECT_EQ(Events("java", "job-start").size(), 1u);
+}
+#endif
+
+TEST_F(Simulator, RejectedChecksumFailsTheDownloadAndPrintingGoesOn) {
+    const std::string job = UelJob(PrintData(5000, 23));
+    WriteFile(Path("job.prn"), job);
+
+    ASSERT_EQ(RunScript("fw-manager checksum-error\nfw-send E1 pattern:100K:4\nfw-expect-images 1 ends 0\n"
+                        "send prn file:job.prn\nexpect-jobs 1\n"),
+              0);
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
+    const std::string log = ReadFile(Out("usbadapter.log"));
+    EXPECT_NE(log.find("Invalid CheckSum Error"), std::string::npos);
+    EXPECT_NE(log.find("[USBAdp] Firmware download failed"), std::string::npos);
+}
+
+TEST_F(Simulator, PjlJobThatOnlyLooksLikeFirmwareIsPrintedByteExact) {
+    // FIRMWARE= without the blanks: a print job like any other.
+    const std::string job = kUel + "@PJL\r\n@PJL FIRMWARE=E7 \r\n" + PrintData(70000, 24) + kUel;
+    WriteFile(Path("job.prn"), job);
+
+    ASSERT_EQ(RunScript("fw-manager\nsend prn file:job.prn\nexpect-jobs 1\nfw-expect-images 0\n"), 0);
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
+}
+
 }  // namespace

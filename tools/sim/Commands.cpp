@@ -9,6 +9,7 @@
 #include <thread>
 
 #include "Data.h"
+#include "FirmwareCommands.h"
 #include "Host.h"
 #include "Script.h"
 #include "Sha256.h"
@@ -597,6 +598,19 @@ const std::vector<Command> kCommands = {
     {"scanner-answer", "TEXT", "the scanner driver answers every scanner-side test with one final record TEXT", 1, 1,
      nullptr, ScannerAnswer},
     {"fax-answer", "TEXT", "the fax driver answers every fax-side test with TEXT", 1, 1, nullptr, FaxAnswer},
+    {"fw-manager", "[MISBEHAVIOUR]",
+     "starts the update manager on loopback and points the library at it; again: changes its behaviour "
+     "(none, checksum-error, progress-fail, silence, early-close, slow-progress)",
+     0, 1, CheckFwManager, FwManager},
+    {"fw-send", "ID DATA... [, ID DATA...]",
+     "sends a firmware file on the print channel: per image an 80-byte header with subsystem id ID, then the body "
+     "DATA, each its own transfer",
+     2, -1, CheckFwSend, FwSend},
+    {"fw-expect-images", "N [ends M]",
+     "the update manager has received N whole images (and M end exchanges); the host is silent after the file", 1,
+     3, CheckFwExpectImages, FwExpectImages},
+    {"fw-expect-image", "K [type T] [bytes N] [sha256 HEX] [checksum ok|bad] [equals DATA...]",
+     "image K (from 1) as the update manager received it", 1, -1, CheckFwExpectImage, FwExpectImage},
 };
 
 }  // namespace

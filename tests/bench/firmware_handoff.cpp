@@ -1,0 +1,159 @@
+// Firmware image hand-off: print channel → fw.bin → update manager, against
+// the same bytes sent over loopback TCP to a plain sink in the same run. The
+// hand-off includes reading the image back whole for its checksum and sending
+// it in 1 KiB blocks; the manager is the update-manager simulator, keeping
+// nothing on disk.
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <benchmark/benchmark.h>
+
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <string>
+#include <thread>
+
+#include "RatioReporter.h"
+#include "UpdateManagerSim.h"
+#include "common/ByteOrder.h"
+#include "firmware/FirmWareUpdate.h"
+#include "vdev.h"
+
+namespace {
+
+std::string Image(size_t n) {
+    std::string s(n, '\0');
+    unsigned x = 7;
+    for (char &c : s) {
+        x = x * 1103515245u + 12345u;
+        c = static_cast<char>(x >> 23);
+    }
+    return s;
+}
+
+std::string Header(uint32_t size) {
+    std::string h = "\x1b%-12345X@PJL\r\n@PJL FIRMWARE = E7  " + std::string(39, ' ') + std::string(6, '\0');
+    WriteBE32(reinterpret_cast<uint8_t *>(h.data()) + 74, size);
+    return h;
+}
+
+// Standard output is where the library marks each block sent.
+class MutedStdout {
+public:
+    MutedStdout() {
+        std::fflush(stdout);
+        saved_ = ::dup(1);
+        int null = ::open("/dev/null", O_WRONLY);
+        ::dup2(null, 1);
+        ::close(null);
+    }
+    ~MutedStdout() {
+        std::fflush(stdout);
+        ::dup2(saved_, 1);
+        ::close(saved_);
+    }
+
+private:
+    int saved_;
+};
+
+void BM_FirmwareHandoff(benchmark::State &state) {
+    const size_t size = static_cast<size_t>(state.range(0));
+    const std::string body = Image(size), header = Header(static_cast<uint32_t>(size));
+    peers::UpdateManagerSim manager;
+    peers::UmOptions o;
+    std::string error;
+    if (!manager.Start(o, &error)) {
+        state.SkipWithError(error.c_str());
+        return;
+    }
+    ::setenv("USBADAPTER_UPDATE_PORT", std::to_string(manager.Port()).c_str(), 1);
+    vdev::Reset();
+    int fd = ::open(vdev::kPrn, O_RDWR);
+    vdev::SetInstantTimeouts(vdev::kPrn, true);
+    MutedStdout muted;
+    for (auto _ : state) {
+        vdev::HostWrite(vdev::kPrn, header.substr(2));
+        vdev::HostWrite(vdev::kPrn, body);
+        U8 cmd[2] = {0x1B, '%'}, out[FW_PJL_HEADER_SIZE];
+        S32 firmware = 0;
+        if (FirmWareDownload(fd, cmd, 2, out, &firmware) != 0) {
+            state.SkipWithError("download failed");
+            break;
+        }
+    }
+    ::close(fd);
+    state.SetBytesProcessed(static_cast<int64_t>(state.iterations()) * static_cast<int64_t>(size));
+}
+BENCHMARK(BM_FirmwareHandoff)->Arg(1 << 20)->Arg(16 << 20)->Unit(benchmark::kMillisecond)->UseRealTime();
+
+// Baseline: the same bytes over loopback TCP in 64 KiB writes to a sink that
+// reads them all and answers one byte.
+void BM_LoopbackTcp(benchmark::State &state) {
+    const size_t size = static_cast<size_t>(state.range(0));
+    const std::string body = Image(size);
+    int ls = ::socket(AF_INET, SOCK_STREAM, 0);
+    sockaddr_in a{};
+    a.sin_family = AF_INET;
+    a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t len = sizeof a;
+    ::bind(ls, reinterpret_cast<sockaddr *>(&a), sizeof a);
+    ::listen(ls, 4);
+    ::getsockname(ls, reinterpret_cast<sockaddr *>(&a), &len);
+    std::thread sink([&] {
+        std::string buf(1 << 16, '\0');
+        for (;;) {
+            int c = ::accept(ls, nullptr, nullptr);
+            if (c < 0) return;
+            size_t got = 0;
+            while (got < size) {
+                ssize_t n = ::recv(c, buf.data(), buf.size(), 0);
+                if (n <= 0) break;
+                got += static_cast<size_t>(n);
+            }
+            ::send(c, "1", 1, MSG_NOSIGNAL);
+            ::close(c);
+            if (got == 0) return;
+        }
+    });
+    for (auto _ : state) {
+        int s = ::socket(AF_INET, SOCK_STREAM, 0);
+        ::connect(s, reinterpret_cast<sockaddr *>(&a), sizeof a);
+        for (size_t at = 0; at < size; at += 1 << 16) ::send(s, body.data() + at, std::min<size_t>(1 << 16, size - at), 0);
+        char ack;
+        ::recv(s, &ack, 1, 0);
+        ::close(s);
+    }
+    // An empty connection ends the sink.
+    int s = ::socket(AF_INET, SOCK_STREAM, 0);
+    ::connect(s, reinterpret_cast<sockaddr *>(&a), sizeof a);
+    ::shutdown(s, SHUT_WR);
+    sink.join();
+    ::close(s);
+    ::close(ls);
+    state.SetBytesProcessed(static_cast<int64_t>(state.iterations()) * static_cast<int64_t>(size));
+}
+BENCHMARK(BM_LoopbackTcp)->Arg(1 << 20)->Arg(16 << 20)->Unit(benchmark::kMillisecond)->UseRealTime();
+
+}  // namespace
+
+int main(int argc, char **argv) {
+    ::setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
+    // fw.bin goes to the working directory.
+    char tmpl[] = "/tmp/usbadapter-bench-fw-XXXXXX";
+    const char *dir = ::mkdtemp(tmpl);
+    if (dir) std::filesystem::current_path(dir);
+    benchmark::Initialize(&argc, argv);
+    RatioReporter reporter;
+    for (int size : {1 << 20, 16 << 20})
+        reporter.Compare("BM_FirmwareHandoff/" + std::to_string(size) + "/real_time",
+                         "BM_LoopbackTcp/" + std::to_string(size) + "/real_time");
+    benchmark::RunSpecifiedBenchmarks(&reporter);
+    reporter.PrintRatios();
+    if (dir) std::filesystem::remove_all(dir);
+    return 0;
+}

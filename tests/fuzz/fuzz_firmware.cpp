@@ -1,0 +1,135 @@
+// Firmware headers and the update-manager dialogue: arbitrary host traffic
+// handed to FirmWareDownload over the emulated print node (instant time-outs),
+// against a manager on loopback whose answers the input chooses.
+//
+// Input: host traffic, then FD FD, then the manager's answers.
+//   In the traffic, FE FF ends a host transfer; its first two bytes are the
+//   ones the classifier has already taken.
+//   The answers are split by FC FC, one piece per connection in order; each
+//   is sent when the library connects and waits until it reads it.
+// Checked: the call returns within a bound, with -1, 0 or a count of at most
+// 80 bytes; it never leaves a connection or descriptor open.
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <string>
+#include <string_view>
+#include <thread>
+#include <vector>
+
+#include "firmware/FirmWareUpdate.h"
+#include "firmware/UpdateManager.h"
+#include "vdev.h"
+
+namespace {
+
+[[noreturn]] void fail(const char *what) {
+    std::fprintf(stderr, "\n== fuzz_firmware: %s\n", what);
+    std::abort();
+}
+
+std::vector<std::string> Split(std::string_view s, std::string_view sep) {
+    std::vector<std::string> out;
+    for (;;) {
+        size_t at = s.find(sep);
+        out.emplace_back(s.substr(0, at));
+        if (at == std::string_view::npos) return out;
+        s.remove_prefix(at + sep.size());
+    }
+}
+
+int g_listen = -1;
+
+void Setup() {
+    // fw.bin lands in the working directory; libFuzzer's paths are relative
+    // to it, so it stays as it is.
+    ::setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
+    g_listen = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_in a{};
+    a.sin_family = AF_INET;
+    a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t len = sizeof a;
+    if (::bind(g_listen, reinterpret_cast<sockaddr *>(&a), sizeof a) != 0 || ::listen(g_listen, 64) != 0 ||
+        ::getsockname(g_listen, reinterpret_cast<sockaddr *>(&a), &len) != 0)
+        fail("cannot listen");
+    ::setenv(UPDATE_PORT_ENV, std::to_string(ntohs(a.sin_port)).c_str(), 1);
+    UpdateManager_SetWaitMs(2);
+    // The marks on standard output are not the fuzzer's business.
+    if (!std::freopen("/dev/null", "w", stdout)) fail("no /dev/null");
+}
+
+int CountFds() {
+    int n = 0;
+    for ([[maybe_unused]] auto &e : std::filesystem::directory_iterator("/proc/self/fd")) ++n;
+    return n;
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
+    static bool ready = (Setup(), true);
+    (void)ready;
+    std::string_view in(reinterpret_cast<const char *>(data), size);
+    std::vector<std::string> parts = Split(in, "\xFD\xFD");
+    std::vector<std::string> transfers = Split(parts[0], "\xFE\xFF");
+    std::vector<std::string> answers = parts.size() > 1 ? Split(parts[1], "\xFC\xFC") : std::vector<std::string>{};
+    if (transfers[0].size() < 2) return 0;
+    const std::string first2 = transfers[0].substr(0, 2);
+    transfers[0].erase(0, 2);
+
+    vdev::Reset();
+    const int before = CountFds();
+    int fd = ::open(vdev::kPrn, O_RDWR);
+    vdev::SetInstantTimeouts(vdev::kPrn, true);
+    for (const std::string &t : transfers)
+        if (!t.empty()) vdev::HostWrite(vdev::kPrn, t);
+
+    std::atomic<bool> done{false};
+    std::thread manager([&] {
+        std::vector<int> conns;
+        size_t next = 0;
+        char buf[4096];
+        while (!done) {
+            pollfd p{g_listen, POLLIN, 0};
+            if (::poll(&p, 1, 1) == 1) {
+                int c = ::accept4(g_listen, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
+                if (c >= 0) {
+                    if (next < answers.size())
+                        ::send(c, answers[next].data(), answers[next].size(), MSG_NOSIGNAL);
+                    ++next;
+                    conns.push_back(c);
+                }
+            }
+            for (int c : conns)
+                while (::recv(c, buf, sizeof buf, 0) > 0) {
+                }
+        }
+        for (int c : conns) ::close(c);
+    });
+
+    U8 cmd[2] = {static_cast<U8>(first2[0]), static_cast<U8>(first2[1])};
+    U8 out[FW_PJL_HEADER_SIZE];
+    S32 firmware = -5;
+    const auto t0 = std::chrono::steady_clock::now();
+    const S32 r = FirmWareDownload(fd, cmd, 2, out, &firmware);
+    if (std::chrono::steady_clock::now() - t0 > std::chrono::seconds(10)) fail("download took more than 10 s");
+    done = true;
+    manager.join();
+    ::close(fd);
+    vdev::Reset();  // the host ends of the node
+    if (r < -1 || r > FW_PJL_HEADER_SIZE) fail("result outside -1..80");
+    if (firmware != 0 && firmware != 1) fail("firmware flag neither 0 nor 1");
+    if (firmware == 0 && r == 0) fail("success without firmware");
+    if (CountFds() != before) fail("a descriptor was left open");
+    return 0;
+}

@@ -1,0 +1,251 @@
+// Firmware download over the emulated print node and a real update manager on
+// loopback (the update-manager simulator, or a scripted peer whose answers a
+// test chooses byte by byte). Every test runs in its own working directory,
+// where "fw.bin" lands.
+#pragma once
+
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <mutex>
+#include <random>
+#include <sstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "LoggerHost.h"
+#include "UpdateManagerSim.h"
+#include "adapter/USB.h"
+#include "common/ByteOrder.h"
+#include "firmware/FirmWareUpdate.h"
+#include "firmware/UpdateManager.h"
+#include "vdev.h"
+
+namespace fwtest {
+
+inline const std::string kHeaderText = "\x1b%-12345X@PJL\r\n@PJL FIRMWARE = ";
+
+// The 80-byte header a host puts in front of an image.
+inline std::string Header(const std::string &id, uint32_t size) {
+    std::string h = kHeaderText + (id + "    ").substr(0, 4) + std::string(39, ' ') + std::string(4, '\0') + "\r\n";
+    WriteBE32(reinterpret_cast<uint8_t *>(h.data()) + 74, size);
+    return h;
+}
+
+inline std::string Body(size_t n, unsigned seed) {
+    std::mt19937 gen(seed);
+    std::string s(n, '\0');
+    for (char &c : s) c = static_cast<char>(gen());
+    return s;
+}
+
+inline std::string ReadFile(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    std::ostringstream all;
+    all << in.rdbuf();
+    return all.str();
+}
+
+inline int OpenDescriptors() {
+    int n = 0;
+    for ([[maybe_unused]] auto &e : std::filesystem::directory_iterator("/proc/self/fd")) ++n;
+    return n;
+}
+
+// A manager that answers with bytes fixed in advance, all at once, and keeps
+// everything the library sends.
+class ScriptedPeer {
+public:
+    // The answers go out once `answerAfter` bytes have come, as a manager
+    // answers what it has read.
+    ScriptedPeer(std::string answers, size_t answerAfter) : answers_(std::move(answers)), answerAfter_(answerAfter) {
+        fd_ = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        sockaddr_in a{};
+        a.sin_family = AF_INET;
+        a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        socklen_t len = sizeof a;
+        ::bind(fd_, reinterpret_cast<sockaddr *>(&a), sizeof a);
+        ::listen(fd_, 4);
+        ::getsockname(fd_, reinterpret_cast<sockaddr *>(&a), &len);
+        port_ = ntohs(a.sin_port);
+        thread_ = std::thread([this] { run(); });
+    }
+    ~ScriptedPeer() {
+        stop_ = true;
+        if (thread_.joinable()) thread_.join();
+        ::close(fd_);
+    }
+    uint16_t port() const { return port_; }
+    // Everything the library sent, once it has closed the connection.
+    std::string finish() {
+        if (thread_.joinable()) thread_.join();
+        return received_;
+    }
+
+private:
+    void run() {
+        int conn = -1;
+        for (int i = 0; i < 400 && !stop_ && conn < 0; ++i) {
+            pollfd p{fd_, POLLIN, 0};
+            if (::poll(&p, 1, 10) == 1) conn = ::accept(fd_, nullptr, nullptr);
+        }
+        if (conn < 0) return;
+        bool answered = false;
+        char buf[4096];
+        for (int idle = 0; !stop_ && idle < 400;) {
+            pollfd p{conn, POLLIN, 0};
+            if (::poll(&p, 1, 10) != 1) {
+                ++idle;
+                continue;
+            }
+            ssize_t n = ::recv(conn, buf, sizeof buf, 0);
+            if (n <= 0) break;
+            received_.append(buf, static_cast<size_t>(n));
+            if (!answered && received_.size() >= answerAfter_) {
+                ::send(conn, answers_.data(), answers_.size(), MSG_NOSIGNAL);
+                answered = true;
+            }
+        }
+        ::close(conn);
+    }
+
+    std::string answers_;
+    size_t answerAfter_;
+    int fd_ = -1;
+    uint16_t port_ = 0;
+    std::atomic<bool> stop_{false};
+    std::thread thread_;
+    std::string received_;
+};
+
+// Standard output (the '#' marks, the subsystem words) kept out of the log.
+struct QuietStdout {
+    QuietStdout() { testing::internal::CaptureStdout(); }
+    ~QuietStdout() { testing::internal::GetCapturedStdout(); }
+};
+
+struct Outcome {
+    S32 result;
+    S32 firmware;
+    std::string handedBack;  // the bytes of firmware_command the result counts
+};
+
+class FirmwareTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        char tmpl[] = "/tmp/usbadapter-fw-XXXXXX";
+        ASSERT_NE(::mkdtemp(tmpl), nullptr);
+        dir_ = tmpl;
+        std::filesystem::create_directories(dir_ + "/manager");
+        oldCwd_ = std::filesystem::current_path();
+        std::filesystem::current_path(dir_);
+        vdev::Reset();
+        LoggerHost_StartCapture();
+        IsDisconnected = 0;
+        hibernation_flag = 0;
+        fd_ = ::open(vdev::kPrn, O_RDWR);
+        ASSERT_GT(fd_, 0);
+        vdev::SetInstantTimeouts(vdev::kPrn, true);
+        // A silent manager costs this much per receive, not 5.5 s.
+        UpdateManager_SetWaitMs(kShortWaitMs);
+    }
+    void TearDown() override {
+        manager_.Stop();
+        UpdateManager_SetWaitMs(-1);
+        ::unsetenv(UPDATE_PORT_ENV);
+        if (fd_ > 0) ::close(fd_);
+        vdev::Reset();
+        IsDisconnected = 0;
+        std::filesystem::current_path(oldCwd_);
+        std::error_code ec;
+        std::filesystem::remove_all(dir_, ec);
+    }
+
+    static constexpr int kShortWaitMs = 150;
+
+    // What the host sent and nobody has read yet (the print reader's).
+    std::string TakePending() {
+        std::string all;
+        char buf[4096];
+        while (vdev::PendingHostBytes(vdev::kPrn) > 0) {
+            ssize_t n = ::read(fd_, buf, sizeof buf);
+            if (n <= 0) break;
+            all.append(buf, static_cast<size_t>(n));
+        }
+        return all;
+    }
+
+    void UsePort(uint16_t port) { ::setenv(UPDATE_PORT_ENV, std::to_string(port).c_str(), 1); }
+
+    void StartManager(peers::UmMisbehaviour m = peers::UmMisbehaviour::None) {
+        peers::UmOptions o;
+        o.dir = dir_ + "/manager";
+        o.misbehaviour = m;
+        o.ioTimeoutMs = 500;
+        o.slowProgressMs = 50;
+        std::string error;
+        ASSERT_TRUE(manager_.Start(o, &error)) << error;
+        UsePort(manager_.Port());
+    }
+
+    // The classifier has taken the first two bytes of `stream`; the host sends
+    // the rest in `cuts` (sizes of transfers, the remainder in one).
+    Outcome Download(const std::string &stream, std::vector<size_t> cuts = {}, U32 commandlen = 2) {
+        size_t at = commandlen;
+        for (size_t c : cuts) {
+            vdev::HostWrite(vdev::kPrn, stream.substr(at, c));
+            at += c;
+        }
+        if (at < stream.size()) vdev::HostWrite(vdev::kPrn, stream.substr(at));
+        U8 command[FW_PJL_HEADER_SIZE + 8] = {};
+        std::memcpy(command, stream.data(), std::min<size_t>(commandlen, stream.size()));
+        U8 out[FW_PJL_HEADER_SIZE];
+        std::memset(out, 0xEE, sizeof out);
+        Outcome o{};
+        o.firmware = -7;
+        o.result = FirmWareDownload(fd_, command, commandlen, out, &o.firmware);
+        if (o.result > 0 && o.result <= FW_PJL_HEADER_SIZE)
+            o.handedBack.assign(reinterpret_cast<char *>(out), static_cast<size_t>(o.result));
+        return o;
+    }
+
+    // A firmware file sent the way a host's driver cuts it: each header and
+    // each body its own transfer.
+    struct Image {
+        std::string id, body;
+    };
+    static std::string File(const std::vector<Image> &images, std::vector<size_t> *cuts) {
+        std::string f;
+        for (const Image &im : images) {
+            cuts->push_back(f.empty() ? 78 : 80);
+            if (!im.body.empty()) cuts->push_back(im.body.size());
+            f += Header(im.id, static_cast<uint32_t>(im.body.size())) + im.body;
+        }
+        cuts->pop_back();
+        return f;
+    }
+    Outcome DownloadImages(const std::vector<Image> &images) {
+        std::vector<size_t> cuts;
+        std::string f = File(images, &cuts);
+        return Download(f, cuts);
+    }
+
+    std::string dir_;
+    std::filesystem::path oldCwd_;
+    int fd_ = -1;
+    peers::UpdateManagerSim manager_;
+};
+
+}  // namespace fwtest

@@ -1,0 +1,349 @@
+// FirmWareDownload as the classifier calls it: the emulated print node on one
+// side, an update manager on loopback on the other.
+#include <chrono>
+
+#include "FirmwareFixture.h"
+#include "adapter/Classifier.h"
+
+namespace fwtest {
+namespace {
+
+using peers::UmMisbehaviour;
+
+// The manager's answers after the checksum: verdict, "$PRO", progress pairs
+// (type in the manager's byte order), "$END".
+std::string Verdict(uint32_t v) {
+    std::string s(4, '\0');
+    WriteBE32(reinterpret_cast<uint8_t *>(s.data()), v);
+    return s;
+}
+std::string Progress(uint32_t type, int8_t p) {
+    std::string s(5, '\0');
+    std::memcpy(s.data(), &type, 4);
+    s[4] = static_cast<char>(p);
+    return s;
+}
+
+TEST_F(FirmwareTest, StreamsThatAreNotFirmwareComeBackAsData) {
+    std::string almost = Header("E7", 4);
+    struct Row {
+        const char *what;
+        std::string stream;
+    } rows[] = {
+        {"FIRMWARE= without blanks", "\x1b%-12345X@PJL\r\n@PJL FIRMWARE=E7  " + std::string(60, 'x')},
+        {"first byte after ESC", "\x1b&" + almost.substr(2)},
+        {"CR LF swapped", almost.substr(0, 13) + "\n\r" + almost.substr(15)},
+        {"last blank", almost.substr(0, 30) + "x" + almost.substr(31)},
+        {"lower-case pjl", almost.substr(0, 9) + "@pjl" + almost.substr(13)},
+        {"a print job", "\x1b%-12345X@PJL ENTER LANGUAGE=PCL\r\n" + std::string(100, 'p')},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.what);
+        LoggerHost_StartCapture();
+        Outcome o = Download(r.stream, {78});
+        EXPECT_EQ(o.result, 80);
+        EXPECT_EQ(o.firmware, 0);
+        EXPECT_EQ(o.handedBack, r.stream.substr(0, 80));
+        EXPECT_EQ(LoggerHost_Count("Not a FirmWare\r\n"), 1);
+        // Only the header was taken; the rest waits for the print reader.
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), r.stream.size() - 80);
+        vdev::Reset();
+        fd_ = ::open(vdev::kPrn, O_RDWR);
+        vdev::SetInstantTimeouts(vdev::kPrn, true);
+    }
+}
+
+TEST_F(FirmwareTest, ShortOrEmptyStreamsComeBackWhole) {
+    Outcome o = Download("\x1b%-12345X");
+    EXPECT_EQ(o.result, 9);
+    EXPECT_EQ(o.handedBack, "\x1b%-12345X");
+    EXPECT_EQ(o.firmware, 0);
+
+    o = Download("\x1b%");
+    EXPECT_EQ(o.result, 2);
+    EXPECT_EQ(o.handedBack, "\x1b%");
+    EXPECT_EQ(LoggerHost_Count("Read Failed\r\n"), 1);
+    EXPECT_EQ(LoggerHost_Count("\r\nread 0 bytes so returning [2]\n"), 1);
+}
+
+TEST_F(FirmwareTest, CommandLengthOfEightyIsRefusedAndSeventyNineReadsOneByte) {
+    const std::string stream = Header("0...", 0) + "next job";
+    Outcome o = Download(stream, {}, 80);
+    EXPECT_EQ(o.result, -1);
+    EXPECT_EQ(o.firmware, 0);
+    EXPECT_EQ(LoggerHost_Count("Command Length seems greater than header size (80)\r\n"), 1);
+    // Nothing is discarded: the channel still holds what followed.
+    EXPECT_TRUE(vdev::ReadSizes(vdev::kPrn).empty());
+
+    vdev::Reset();
+    fd_ = ::open(vdev::kPrn, O_RDWR);
+    vdev::SetInstantTimeouts(vdev::kPrn, true);
+    o = Download(std::string(79, 'x') + "yz", {1}, 79);
+    EXPECT_EQ(vdev::ReadSizes(vdev::kPrn).at(0), 1u);
+    EXPECT_EQ(o.result, 80);
+    EXPECT_EQ(o.handedBack, std::string(79, 'x') + "y");
+    EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 1u);
+}
+
+TEST_F(FirmwareTest, ImagesReachTheManagerWithChainedChecksums) {
+    StartManager();
+    struct Row {
+        const char *what;
+        std::vector<Image> images;
+    } rows[] = {
+        {"one image", {{"E7  ", Body(5000, 1)}}},
+        {"odd body length", {{"ec1 ", Body(1023, 2)}}},
+        {"empty body", {{"ED", ""}}},
+        {"two images", {{"E1", Body(70000, 3)}, {"EE4", Body(333, 4)}}},
+        {"three, one empty", {{"E5", Body(10, 5)}, {"E6", ""}, {"EB", Body(4097, 6)}}},
+    };
+    size_t seen = 0;
+    int ends = 0;
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.what);
+        LoggerHost_StartCapture();
+        QuietStdout quiet;
+        Outcome o = DownloadImages(r.images);
+        EXPECT_EQ(o.result, 0);
+        EXPECT_EQ(o.firmware, 1);
+        EXPECT_EQ(LoggerHost_Count("FirmWare Update Done....Rebooting\r\n"), 1);
+        ASSERT_TRUE(manager_.WaitFor([&] { return manager_.Ends() == ends + 1; }, 3000));
+        ++ends;
+        std::vector<peers::UmImage> got = manager_.Images();
+        ASSERT_EQ(got.size(), seen + r.images.size());
+        for (size_t i = 0; i < r.images.size(); ++i) {
+            const peers::UmImage &im = got[seen + i];
+            EXPECT_EQ(im.type, Convert_FW_SubSID(reinterpret_cast<const U8 *>(r.images[i].id.c_str())));
+            EXPECT_EQ(im.size, r.images[i].body.size());
+            EXPECT_TRUE(im.checksumOk);
+            // Only a later image of the file starts from the previous checksum.
+            EXPECT_EQ(im.chained, i > 0);
+            EXPECT_EQ(ReadFile(im.file), r.images[i].body);
+        }
+        EXPECT_EQ(ReadFile(TEMP_FW_IMAGE), r.images.back().body);
+        seen = got.size();
+    }
+    EXPECT_TRUE(manager_.Errors().empty());
+    // Progress as the manager reported it, named by type.
+    EXPECT_EQ(LoggerHost_Count("fw type UI\tProgress 40%\r\n"), 1);
+    EXPECT_EQ(LoggerHost_Count("fw type UI\tProgress 100%\r\n"), 1);
+}
+
+TEST_F(FirmwareTest, ManagerAnswersDecideTheOutcome) {
+    const uint32_t scan = SCAN;
+    const std::string tail = "$PRO" + Progress(scan, 50) + Progress(scan, 100) + "$END";
+    struct Row {
+        const char *what;
+        std::string answers;
+        S32 result;
+        const char *line;  // logged once ("" for none)
+    } rows[] = {
+        {"verdict 1", Verdict(1) + tail, 0, "FirmWare Update Done....Rebooting\r\n"},
+        {"verdict 0 continues", Verdict(0) + tail, 0, "Response got is 0x0000\r\n"},
+        {"verdict 3 continues", Verdict(3) + tail, 0, "Response got is 0x0003\r\n"},
+        {"verdict 2 stops", Verdict(2) + tail, -1, "Invalid CheckSum Error\r\n"},
+        {"no $PRO", Verdict(1) + "$PRX" + tail.substr(4), -1, "PROGRESS not received\r\n"},
+        {"progress -1", Verdict(1) + "$PRO" + Progress(scan, 20) + Progress(scan, -1), -1,
+         "Download of FirmWare Failed\r\n"},
+        {"progress above 100 ends it", Verdict(1) + "$PRO" + Progress(scan, 120) + "$END", 0,
+         "fw type SCAN\tProgress 120%\r\n"},
+        {"garbage instead of $END", Verdict(1) + "$PRO" + Progress(scan, 100) + "$ENX", -1, ""},
+        {"silence after progress", Verdict(1) + "$PRO" + Progress(scan, 10), -1, "Download of FirmWare Failed\r\n"},
+        {"silence after the verdict", Verdict(1), -1, "PROGRESS not received\r\n"},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.what);
+        LoggerHost_StartCapture();
+        const std::string body = Body(100, 7);
+        std::string want = "$IMG" + Verdict(SCAN) + Verdict(100) + body;
+        ScriptedPeer peer(r.answers, want.size() + 2);
+        UsePort(peer.port());
+        QuietStdout quiet;
+        Outcome o = DownloadImages({{"E7", body}});
+        EXPECT_EQ(o.result, r.result);
+        EXPECT_EQ(o.firmware, 1);
+        if (*r.line) {
+            EXPECT_EQ(LoggerHost_Count(r.line), 1);
+        }
+        EXPECT_EQ(LoggerHost_Count("FirmWare Update Done....Rebooting\r\n"), r.result == 0 ? 1 : 0);
+        // The requests in order; "$END" only when the verdict let it go on.
+        const std::string got = peer.finish();
+        ASSERT_GE(got.size(), want.size() + 2);
+        EXPECT_EQ(got.substr(0, want.size()), want);
+        const bool ended = got.size() == want.size() + 6 && got.substr(want.size() + 2) == "$END";
+        EXPECT_EQ(ended, std::string(r.what) != "verdict 2 stops");
+    }
+}
+
+TEST_F(FirmwareTest, MisbehavingManagerFailsTheDownloadWithinItsTimeOuts) {
+    struct Row {
+        UmMisbehaviour m;
+        S32 result;
+        const char *line;
+    } rows[] = {
+        {UmMisbehaviour::ChecksumError, -1, "Invalid CheckSum Error\r\n"},
+        {UmMisbehaviour::ProgressFail, -1, "Download of FirmWare Failed\r\n"},
+        {UmMisbehaviour::Silence, -1, "PROGRESS not received\r\n"},
+        {UmMisbehaviour::EarlyClose, -1, "PROGRESS not received\r\n"},
+        {UmMisbehaviour::SlowProgress, 0, "FirmWare Update Done....Rebooting\r\n"},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(peers::UmMisbehaviourName(r.m));
+        LoggerHost_StartCapture();
+        StartManager(r.m);
+        auto t0 = std::chrono::steady_clock::now();
+        QuietStdout quiet;
+        Outcome o = DownloadImages({{"E2", Body(3000, 8)}});
+        EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(3));
+        EXPECT_EQ(o.result, r.result);
+        EXPECT_EQ(LoggerHost_Count(r.line), 1);
+        manager_.Stop();
+    }
+}
+
+TEST_F(FirmwareTest, FailuresBeforeTheBodyDiscardItAndTheNextJobStaysWhole) {
+    const std::string job = "\x1b%-12345X@PJL ENTER LANGUAGE=PCL\r\nnext job";
+    struct Row {
+        const char *what;
+        std::string id;
+        bool manager;
+        const char *line;
+    } rows[] = {
+        {"unavailable type", "0E7 ", true, "Firmware Type Unknown\r\n"},
+        {"garbage id", "\x01\xfe??", true, "Firmware Type Unknown\r\n"},
+        {"no manager", "E7", false, "Socket Initialization failed\r\n"},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.what);
+        LoggerHost_StartCapture();
+        if (r.manager) StartManager();
+        else UsePort(1);  // nothing listens there
+        const std::string body = Body(3000, 9);
+        QuietStdout quiet;
+        Outcome o = Download(Header(r.id, 3000) + body + job, {78, 3000});
+        EXPECT_EQ(o.result, -1);
+        EXPECT_EQ(o.firmware, 1);
+        EXPECT_EQ(LoggerHost_Count(r.line), 1);
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), job.size());
+        EXPECT_EQ(manager_.Connections(), 0);
+        manager_.Stop();
+        vdev::Reset();
+        fd_ = ::open(vdev::kPrn, O_RDWR);
+        vdev::SetInstantTimeouts(vdev::kPrn, true);
+    }
+}
+
+TEST_F(FirmwareTest, CutOrOverAnnouncedBodiesEndBoundedAndTakeNothingMore) {
+    struct Row {
+        const char *what;
+        uint32_t announced;
+        size_t sent;
+        bool cablePulled;
+        int flushFailures;
+        S32 result;
+        size_t left;  // bytes of the body the download leaves on the channel
+    } rows[] = {
+        {"announced more than sent", 10000, 3000, false, 5, -1, 0},
+        {"cable pulled inside the body", 10000, 3000, true, 1, -1, 0},
+        {"size 0x7fffffff", 0x7FFFFFFF, 100, false, 5, -1, 0},
+        // Negative as a count: nothing is taken as body, so the bytes behind
+        // the header are the next header, here not firmware.
+        {"size 0xffffffff", 0xFFFFFFFF, 100, false, 0, 80, 20},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.what);
+        LoggerHost_StartCapture();
+        StartManager();
+        IsDisconnected = r.cablePulled;
+        auto t0 = std::chrono::steady_clock::now();
+        QuietStdout quiet;
+        Outcome o = Download(Header("E7", r.announced) + Body(r.sent, 10), {78});
+        EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(3));
+        EXPECT_EQ(o.result, r.result);
+        EXPECT_EQ(o.firmware, 1);
+        EXPECT_EQ(LoggerHost_Count("Data Read Error: can't Flush\n"), r.flushFailures);
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), r.left);
+        IsDisconnected = 0;
+        manager_.Stop();
+        // The next job after the host's silence is untouched by the failure.
+        vdev::HostWrite(vdev::kPrn, "next job");
+        EXPECT_EQ(TakePending().substr(r.left), "next job");
+    }
+}
+
+TEST_F(FirmwareTest, WhatFollowsTheLastImageDecidesTheEnd) {
+    StartManager();
+    const std::string body = Body(500, 11);
+    const std::string second = "\x1b%-12345X@PJL ENTER LANGUAGE=PCL\r\n" + std::string(60, 'q');
+    struct Row {
+        const char *what;
+        std::string after;
+        S32 result;
+        std::string handedBack;
+    } rows[] = {
+        {"nothing", "", 0, ""},
+        {"a short read", std::string(40, 's'), 0, ""},
+        {"79 bytes", std::string(79, 's'), 0, ""},
+        {"a header that is not firmware", second.substr(0, 80), 80, second.substr(0, 80)},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.what);
+        QuietStdout quiet;
+        Outcome o = Download(Header("E8", 500) + body + r.after, {78, 500});
+        EXPECT_EQ(o.result, r.result);
+        EXPECT_EQ(o.firmware, 1);
+        EXPECT_EQ(o.handedBack, r.handedBack);
+    }
+}
+
+// The print reader's view: the classifier's firmware branch, then a print job.
+TEST_F(FirmwareTest, ClassifierReportsTheDownloadAndTheReaderGoesOn) {
+    StartManager();
+    fdPrn = fd_;
+    struct Row {
+        std::string id;
+        S32 result;
+        const char *line;
+    } rows[] = {
+        {"E7", 0, "[USBAdp] Firmware download success\n"},
+        {"3...", -2, "[USBAdp] Firmware download failed\n"},
+    };
+    for (const Row &r : rows) {
+        LoggerHost_StartCapture();
+        const std::string file = Header(r.id, 10) + Body(10, 12);
+        vdev::HostWrite(vdev::kPrn, file.substr(2, 78));
+        vdev::HostWrite(vdev::kPrn, file.substr(80));
+        U8 cmd[COMMAND_SIZE] = {0x1B, '%'};
+        U8 fw[FRM_DETECT_BUFFER_SIZE];
+        S32 firmRes = -9;
+        TUSBAdp_ParserID id;
+        QuietStdout quiet;
+        EXPECT_EQ(USBAdpater_StartDataClassifier(cmd, fw, &firmRes, &id), r.result);
+        EXPECT_EQ(LoggerHost_Count(r.line), 1);
+    }
+    fdPrn = 0;
+}
+
+// A process survives many firmware files, successful or refused.
+TEST_F(FirmwareTest, ThousandDownloadsLeaveNoDescriptorBehind) {
+    StartManager();
+    const std::vector<Image> images = {{"E7", Body(64, 13)}, {"E1", Body(33, 14)}};
+    QuietStdout quiet;
+    DownloadImages(images);  // first use may open what stays for good (logging)
+    ASSERT_TRUE(manager_.WaitFor([&] { return manager_.Active() == 0; }, 3000));
+    const int before = OpenDescriptors();
+    int ok = 0;
+    for (int i = 0; i < 1000; ++i) {
+        manager_.SetMisbehaviour(i % 2 ? UmMisbehaviour::ChecksumError : UmMisbehaviour::None);
+        ok += DownloadImages(images).result == 0;
+        // After a refused first image the rest of the file is the reader's.
+        TakePending();
+    }
+    EXPECT_EQ(ok, 500);
+    EXPECT_EQ(manager_.Images().size(), 1000u + 500u + 2u);
+    ASSERT_TRUE(manager_.WaitFor([&] { return manager_.Active() == 0; }, 3000));
+    EXPECT_EQ(OpenDescriptors(), before);
+}
+
+}  // namespace
+}  // namespace fwtest

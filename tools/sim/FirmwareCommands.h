@@ -1,0 +1,21 @@
+// Script commands of the firmware scenario: an update manager on loopback
+// (tools/peers) that the library is pointed at, firmware files sent down the
+// print channel, and what the manager received.
+#pragma once
+
+#include <string>
+
+#include "Script.h"
+
+namespace sim {
+
+bool CheckFwManager(const Args &a, std::string *error);
+bool FwManager(Session &s, const Args &a, std::string *error);
+bool CheckFwSend(const Args &a, std::string *error);
+bool FwSend(Session &s, const Args &a, std::string *error);
+bool CheckFwExpectImages(const Args &a, std::string *error);
+bool FwExpectImages(Session &s, const Args &a, std::string *error);
+bool CheckFwExpectImage(const Args &a, std::string *error);
+bool FwExpectImage(Session &s, const Args &a, std::string *error);
+
+}  // namespace sim
