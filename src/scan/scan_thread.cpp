@@ -168,8 +168,9 @@ void USBAdpScan_ReadTurn(void) {
     if (Wait_PollIn(fd, kPollSliceMs, &revents, mayNotRead) <= 0) return;  // nothing yet, or closing
 
     inPacket = 1;
-    // A close requested since the check above finds inPacket set, or is seen here.
-    if (mayRead()) {
+    // A close requested since the check above finds inPacket set, or is seen
+    // here; a descriptor closed and re-opened meanwhile is polled again first.
+    if (mayRead() && fd == fdScan.load()) {
         // A node that is ready but gives nothing (failed, hung up) must not be
         // read in a tight loop.
         if (readPacket(fd) <= 0) Wait_IdleRest(start, kPollSliceMs, mayNotRead);
