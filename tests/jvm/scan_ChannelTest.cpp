@@ -152,3 +152,25 @@ TEST_F(ScanChannel, ClosedChannelIsLeftAloneUntilJavaReopensIt) {
 }
 
 }  // namespace
+
+namespace {
+
+TEST_F(ScanChannel, ReadScanMsgReturnsToJavaWhenTheScanNodeIsMissing) {
+    vdev::SetPresent(vdev::kScan, false);
+    JNIEnv *env = jvm::Env();
+    jobject daemon = jvm::New(fixtures::kRecordingDaemon);
+    jmethodID mid = env->GetMethodID(jvm::Class(jvm::kPrintAndScanService), "readScanMsg", "(Ljava/lang/Object;)V");
+    env->CallVoidMethod(daemon, mid, daemon);
+    EXPECT_EQ(jvm::TakeException(env), "");
+    EXPECT_EQ(LoggerHost_Count("[USBAdp Scan] Scan channel not present(/dev/usb/mfp_scan), errno:2\n"), 1);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp Scan] USBAdpScan_Init() fails\n"), 1);
+    // The entry is free again: a second call gets as far as the node again.
+    env->CallVoidMethod(daemon, mid, daemon);
+    EXPECT_EQ(jvm::TakeException(env), "");
+    EXPECT_EQ(LoggerHost_Count("[USBAdp Scan] USBAdpScan_Init() fails\n"), 2);
+    env->CallVoidMethod(daemon, mid, nullptr);
+    EXPECT_EQ(jvm::TakeException(env), "");
+    EXPECT_EQ(LoggerHost_Count("[USBAdp Scan] (env(1) == NULL) || (p_scan_obj(0) == NULL)\n"), 1);
+}
+
+}  // namespace
