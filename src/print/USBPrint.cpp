@@ -12,7 +12,7 @@ std::atomic<JNIEnv *> globalPrintEnv{nullptr};
 std::atomic<jobject> globalPrintObj{nullptr};
 std::atomic<jobject> globalMAAObj{nullptr};
 std::atomic<jobject> globalUSBPrintFileStreamObj{nullptr};
-std::atomic<jobject> globalUSBAppStreamobj{nullptr};
+thread_local std::atomic<jobject> globalUSBAppStreamobj{nullptr};
 std::atomic<S32> faxAvailability{0};
 
 namespace {

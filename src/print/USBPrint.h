@@ -18,7 +18,9 @@ extern std::atomic<jobject> globalMAAObj;
 // Handler of the print job in progress; null between jobs.
 extern std::atomic<jobject> globalUSBPrintFileStreamObj;
 // Stream of the application transfer in progress; null between transfers.
-extern std::atomic<jobject> globalUSBAppStreamobj;
+// One per thread: the print and scan readers forward transfers at the same
+// time, and one must not replace (and release) the other's stream.
+extern thread_local std::atomic<jobject> globalUSBAppStreamobj;
 extern std::atomic<S32> faxAvailability;
 
 // Print job: RegisterJob once, PassData per chunk, NotifyEndOfData once.

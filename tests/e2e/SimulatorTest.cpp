@@ -402,3 +402,21 @@ TEST_F(Simulator, PjlJobThatOnlyLooksLikeFirmwareIsPrintedByteExact) {
 }
 
 }  // namespace
+
+// The scan sample passes; an application transfer of another type or other
+// bytes than expected, or a capability reply the host did not get, fails.
+TEST_F(Simulator, ScanPacketsAndCapabilityRepliesAreCheckedByTypeAndBytes) {
+    ASSERT_EQ(Run({"--script", std::string(USBADAPTER_SOURCE_DIR) + "/tools/sim/samples/scan.sim"}), 0);
+    EXPECT_EQ(Events("sim", "expect").size(), 15u);
+
+    const std::pair<const char *, const char *> failing[] = {
+        {"scan-start\nsend scan hex:1ba8280100\nexpect-app 1 ids\n", "is of type pcscan"},
+        {"scan-start\nsend scan hex:1ba8280100\nexpect-app 1 pcscan equals hex:1ba8280101\n", "holds 1ba8280100"},
+        {"scan-start\nset timeout 300\nsend scan hex:1b24f407000000000000\nexpect-capability scan size\n", "read back ,"},
+    };
+    for (const auto &[script, why] : failing) {
+        SCOPED_TRACE(script);
+        EXPECT_EQ(RunScript(script), 1);
+        EXPECT_NE(output_.find(why), std::string::npos);
+    }
+}

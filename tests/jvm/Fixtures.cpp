@@ -93,6 +93,8 @@ std::string AppType(int app) { return StaticString("appType", "(I)Ljava/lang/Str
 
 std::string AppBytes(int app) { return StaticBytes("appBytes", app); }
 
+std::string AppThread(int app) { return StaticString("appThread", "(I)Ljava/lang/String;", app); }
+
 int AppWriteCount(int app) { return jvm::CallStaticInt(kJournal, "appWriteCount", "(I)I", jint{app}); }
 
 bool AppClosed(int app) { return jvm::CallStaticBoolean(kJournal, "appClosed", "(I)Z", jint{app}); }

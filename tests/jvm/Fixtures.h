@@ -49,6 +49,7 @@ bool AwaitJobEnded(int job, int timeoutMs);
 int AppCount();
 std::string AppType(int app);
 std::string AppBytes(int app);            // everything written
+std::string AppThread(int app);           // name of the thread that called processData
 int AppWriteCount(int app);
 bool AppClosed(int app);
 

@@ -542,6 +542,130 @@ bool FaxAnswer(Session &s, const Args &a, std::string *) {
     return true;
 }
 
+// ---- scan channel and capability queries --------------------------------------------
+
+constexpr const char kScanServiceSig[] = "()Lcom/tarnwel/vbk/ca/plugin/usbadapter/scan/USBScanService;";
+
+// An int method of `obj` called from the script's thread; false with a reason
+// when it is missing or threw.
+bool CallIntMethod(Session &s, jobject obj, const char *name, const char *sig, jint *result, std::string *error) {
+    jclass cls = s.env->GetObjectClass(obj);
+    jmethodID mid = s.env->GetMethodID(cls, name, sig);
+    s.env->DeleteLocalRef(cls);
+    if (!mid) {
+        TakeException(s.env);
+        *error = std::string("no method ") + name + sig;
+        return false;
+    }
+    *result = s.env->CallIntMethod(obj, mid);
+    std::string thrown = TakeException(s.env);
+    if (!thrown.empty()) *error = std::string(name) + " threw " + thrown;
+    return thrown.empty();
+}
+
+bool ScanStart(Session &s, const Args &, std::string *error) {
+    jobject scan = CallObject(s.env, s.service, "getScanService", kScanServiceSig, error);
+    if (!scan) return false;
+    jobject thread = CallObject(s.env, scan, "start", "()Ljava/lang/Thread;", error);
+    s.env->DeleteGlobalRef(scan);
+    if (!thread) return false;
+    s.env->DeleteGlobalRef(thread);
+    s.Sim(JsonLine("scan-start"));
+    if (!WaitUntil([] { return vdev::OpenCount(vdev::kScan) > 0; }, s.timeoutMs)) {
+        *error = "the scan reader did not open the scan node";
+        return false;
+    }
+    return true;
+}
+
+// scan-open / scan-close: the scan service's own calls, each answering 1.
+bool ScanOpenClose(Session &s, const char *method, std::string *error) {
+    jobject scan = CallObject(s.env, s.service, "getScanService", kScanServiceSig, error);
+    if (!scan) return false;
+    jint result = 0;
+    bool called = CallIntMethod(s, scan, method, "()I", &result, error);
+    s.env->DeleteGlobalRef(scan);
+    if (!called) return false;
+    return Expect(s, JsonLine("expect").Str("what", std::string("scan-") + method).Num("got", result), result == 1,
+                  std::string("the scan service's ") + method + " answered " + std::to_string(result), error);
+}
+bool ScanOpen(Session &s, const Args &, std::string *error) { return ScanOpenClose(s, "open", error); }
+bool ScanClose(Session &s, const Args &, std::string *error) { return ScanOpenClose(s, "close", error); }
+
+// expect-app K TYPE [equals DATA...]
+bool CheckExpectApp(const Args &a, std::string *error) {
+    long long v;
+    if (!ParseCount(a[0], &v, error)) return false;
+    if (a.size() == 2) return true;
+    if (a[2] != "equals") {
+        *error = "unexpected '" + a[2] + "' (equals)";
+        return false;
+    }
+    return CheckDataItems(a.begin() + 3, a.end(), error);
+}
+
+bool ExpectApp(Session &s, const Args &a, std::string *error) {
+    long long number = 0;
+    if (!ParseCount(a[0], &number, error)) return false;
+    // The scan reader has no idle state to wait for: the transfer's end is.
+    auto ended = [&] {
+        s.SyncJava();
+        return number >= 1 && number <= static_cast<long long>(s.apps.size()) && s.apps[number - 1].ended;
+    };
+    WaitUntil(ended, s.timeoutMs);
+    JsonLine line("expect");
+    line.Str("what", "app").Num("app", number).Str("want-type", a[1]);
+    if (!ended()) return Expect(s, line, false, "application transfer " + a[0] + " has not ended", error);
+    const AppRecord &app = s.apps[number - 1];
+    line.Str("type", app.type).Num("bytes", app.bytes);
+    std::string failure;
+    if (app.type != a[1]) failure = "application transfer " + a[0] + " is of type " + app.type;
+    if (failure.empty() && a.size() > 2) {
+        std::string want, got;
+        if (!Data(s, a.begin() + 3, a.end(), &want, error)) return false;
+        line.Str("want-hex", Hex(want));
+        if (!ReadFileBytes(s.outDir + "/" + app.file, &got))
+            failure = "cannot read " + app.file;
+        else if (got != want)
+            failure = "application transfer " + a[0] + " holds " + Hex(got) + ", expected " + Hex(want);
+    }
+    return Expect(s, line, failure.empty(), failure, error);
+}
+
+// expect-capability CHAN size|data: the reply to a capability request is what
+// the reference service answers (asked here, from the script's thread).
+bool CheckExpectCapability(const Args &a, std::string *error) {
+    if (!CheckChannel(a[0], error)) return false;
+    if (a[1] == "size" || a[1] == "data") return true;
+    *error = "capability reply: size or data";
+    return false;
+}
+
+bool ExpectCapability(Session &s, const Args &a, std::string *error) {
+    std::string want;
+    if (a[1] == "size") {
+        jint size = 0;
+        if (!CallIntMethod(s, s.service, "getCapXmlSize", "()I", &size, error)) return false;
+        want = std::string("\x1b\x24\xf4\0\0\0\0\0\0\0", 10);
+        WriteBE32(reinterpret_cast<uint8_t *>(want.data()) + 6, static_cast<uint32_t>(size));
+    } else {
+        jobject xml = CallObject(s.env, s.service, "getCapXmlData", "()Ljava/lang/String;", error);
+        if (!xml) return false;
+        if (const char *chars = s.env->GetStringUTFChars(static_cast<jstring>(xml), nullptr)) {
+            want = chars;
+            s.env->ReleaseStringUTFChars(static_cast<jstring>(xml), chars);
+        }
+        s.env->DeleteGlobalRef(xml);
+    }
+    const char *path = ChannelPath(a[0]);
+    std::vector<uint8_t> raw = vdev::HostReadAtLeast(path, want.size(), s.timeoutMs);
+    JournalRead(s, a[0], raw);
+    std::string got(raw.begin(), raw.end());
+    JsonLine line("expect");
+    line.Str("what", "capability").Str("chan", a[0]).Str("reply", a[1]).Str("want", Hex(want)).Str("got", Hex(got));
+    return Expect(s, line, got == want, "read back " + Hex(got) + ", expected " + Hex(want), error);
+}
+
 const std::vector<Command> kCommands = {
     {"plug", "",
      "the host configures the device (MFP_DEV_CONFIGURED); the first time, waits until the print reader reads", 0, 0,
@@ -572,6 +696,20 @@ const std::vector<Command> kCommands = {
      "print job K (from 1) has ended with these properties; equals also compares the job file", 1, -1, CheckExpectJob,
      ExpectJob},
     {"expect-apps", "N", "N application transfers have ended on the Java side", 1, 1, CheckNumberArgs, ExpectApps},
+    {"scan-start", "",
+     "starts the scan reader on the scan service's thread (it reads once the device is plugged in); waits until it "
+     "has opened the scan node",
+     0, 0, nullptr, ScanStart},
+    {"scan-close", "", "the scan service closes the scan interface (after the packet in progress); expects 1", 0, 0,
+     nullptr, ScanClose},
+    {"scan-open", "", "the scan service re-opens the scan interface; expects 1", 0, 0, nullptr, ScanOpen},
+    {"expect-app", "K TYPE [equals DATA...]",
+     "application transfer K (from 1) has ended with type TYPE (pcscan, scan2pc, taviklight, ids, dcu, ...); equals "
+     "compares its bytes",
+     2, -1, CheckExpectApp, ExpectApp},
+    {"expect-capability", "CHAN size|data",
+     "reads back on CHAN the reply to a capability request: the size reply or the XML the service answers", 2, 2,
+     CheckExpectCapability, ExpectCapability},
     {"sleep", "MS", "waits MS milliseconds of real time", 1, 1, CheckNumberArgs, Sleep},
     {"set", "timeout MS", "bound of every later wait (default 10000)", 2, 2, CheckSet, Set},
     {"note", "TEXT...", "writes TEXT into the journal", 0, -1, nullptr, Note},

@@ -1,5 +1,6 @@
 package com.tarnwel.vbk.ca.plugin.usbadapter.print;
 
+import com.tarnwel.vbk.ca.plugin.usbadapter.scan.USBScanService;
 import java.io.BufferedOutputStream;
 import java.io.FileOutputStream;
 import java.io.IOException;
@@ -33,7 +34,11 @@ import java.util.concurrent.TimeUnit;
  *     {"event":"app-end","app":N,"type":"<type>","bytes":B,"sha256":"<hex>","file":"app-NNN-TYPE.bin"}
  *     {"event":"call","method":"<daemon method>","arg":"<argument>","reply":"<reply>"}
  *       ("arg" and "reply" only where the method has them; for runUsbFunctionCall on
- *       the MAA object "arg" is ID(ARG0,ARG1,...))
+ *       the MAA object "arg" is ID(ARG0,ARG1,...); for getPrintImage the reply is the
+ *       image's size and SHA-256, "<bytes>:<hex>")
+ * Scan packets arrive as application transfers ("pcscan", "scan2pc", "taviklight",
+ * "ids"), capability queries as calls of getCapXmlSize and getCapXmlData. The print
+ * image is the file named by system property usbadapter.printimage (none: empty).
  * With no engine attached, engine commands answer "OK:" and the command, and a
  * general function that no one registered on the MAA object answers
  * "OK:ID(ARG0,ARG1,...)", so a host script sees what reached Java.
@@ -46,6 +51,7 @@ public class ReferencePrintService extends USBPrintDaemon {
     private final USBMaaService maa = new JournaledMaaService();
     private final List<FileJob> openJobs = new ArrayList<>();
     private final ScheduledExecutorService watcher;
+    private final USBScanService scan = new USBScanService(this);
     private int jobCount;
     private int appCount;
 
@@ -77,10 +83,12 @@ public class ReferencePrintService extends USBPrintDaemon {
         printReader.start();
         initDevice();
         if (scan) {
-            Thread scanReader = new Thread(() -> readScanMsg(this), "usbadapter-scan");
-            scanReader.setDaemon(true);
-            scanReader.start();
+            this.scan.start();
         }
+    }
+
+    public USBScanService getScanService() {
+        return scan;
     }
 
     public USBMaaService getMaaService() {
@@ -137,6 +145,29 @@ public class ReferencePrintService extends USBPrintDaemon {
         int[] ids = super.getInstalledInterpreter();
         call("getInstalledInterpreter", null, Arrays.toString(ids));
         return ids;
+    }
+
+    @Override
+    public int getCapXmlSize() {
+        int size = super.getCapXmlSize();
+        call("getCapXmlSize", null, Integer.toString(size));
+        return size;
+    }
+
+    @Override
+    public byte[] getPrintImage() {
+        byte[] image = new byte[0];
+        String file = System.getProperty("usbadapter.printimage");
+        if (file != null) {
+            try {
+                image = Files.readAllBytes(Paths.get(file));
+            } catch (IOException e) {
+                call("getPrintImage", null, "unreadable: " + e.getMessage());
+                return image;
+            }
+        }
+        call("getPrintImage", null, image.length + ":" + HexFormat.of().formatHex(sha256().digest(image)));
+        return image;
     }
 
     @Override
