@@ -57,6 +57,14 @@ Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIServ
         std::free(data);
         return;
     }
+    // The handle of the host application in progress; none yet (0) must not
+    // send the response to standard input.
+    if (slDeviceHndl.load() <= 0) {
+        USBADP_LOG(ERROR, "[UsbAdp] [write] no host application handle, slDeviceHndl: %ld\n",
+                   static_cast<long>(slDeviceHndl.load()));
+        std::free(data);
+        return;
+    }
     S32 done = 0;
     while (done < slDataLen) {
         ssize_t slRet = ::write(slDeviceHndl.load(), data + done, static_cast<size_t>(slDataLen - done));
