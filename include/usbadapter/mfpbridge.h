@@ -115,9 +115,15 @@ typedef struct msgbuf_usbadp {
 #define SCAN_CMD_SIZE 4
 #define VENDOR_REQ_SIZE 8
 #define VENDOR_DATA_SIZE 8
-/* Sizes owned by the bridge driver's own header. */
+/* Sizes owned by the bridge driver's own header, which this tree does not
+ * have: set at configure time (USBADAPTER_WINDOW_DATA_SIZE,
+ * USBADAPTER_DEV_ID_MAX_SIZE); the values below are the defaults. */
+#ifndef WINDOW_DATA_SIZE
 #define WINDOW_DATA_SIZE 64
+#endif
+#ifndef DEV_ID_MAX_SIZE
 #define DEV_ID_MAX_SIZE 1024
+#endif
 
 typedef U8 mfp_scan_cmd_t[SCAN_CMD_SIZE];
 typedef U8 mfp_vendor_req_t[VENDOR_REQ_SIZE];

@@ -464,8 +464,97 @@ void StartReading(void) {
         IsCanClose = hibernation_flag.load() == 1 ? 1 : 0;
         while (!shouldPark()) USBAdapter_ReadPass();
         USBAdapter_EndJobOnPark();
+        // The open job is ended: a close waiting for the reader need not
+        // wait for the pause as well.
+        if (hibernation_flag.load() == 1) IsCanClose = 1;
         ::sleep(1);
     }
+}
+
+bool USBAdapter_PreparePrnNode(void) {
+    // The handler logs through the deferred path, whose worker must exist first.
+    Log_StartDeferredWorker();
+    struct sigaction sa;
+    std::memset(&sa, 0, sizeof sa);
+    sa.sa_handler = PrnScanSighandler;
+    if (int r = sigemptyset(&sa.sa_mask); r < 0) {
+        USBADP_LOG(ERROR, "[USBAdp]Error in sigemptyset for print. return value of sigemptyset is %ld\n",
+                   static_cast<long>(r));
+        return false;
+    }
+    if (int r = sigaction(SIGIO, &sa, nullptr); r < 0) {
+        USBADP_LOG(ERROR, "[USBAdp][scan thread] sigaction failed for print. return value of sigaction is %ld\n",
+                   static_cast<long>(r));
+        return false;
+    }
+
+    const int fd = fdPrn.load();
+    if (fd < 0) {
+        USBADP_LOG(ERROR, "[USBAdp]Error in opening file: %s\n", MS_PRN_FILE_NAME);
+        fdPrn = 0;  // so that a later set-up opens the node again
+        return false;
+    }
+    // Asynchronous notification with the flags of descriptor 0, as the bridge
+    // set-up has always done.
+    if (::fcntl(fd, F_SETOWN, ::getpid()) < 0 || ::fcntl(fd, F_GETFL) < 0) {
+        USBADP_LOG(ERROR, "[USBAdp]fcntl failed.\n");
+        return false;
+    }
+    int stdinFlags = ::fcntl(0, F_GETFL);
+    if (stdinFlags < 0 || ::fcntl(fd, F_SETFL, stdinFlags | FASYNC) < 0) {
+        USBADP_LOG(ERROR, "[USBAdp]fcntl failed.\n");
+        return false;
+    }
+
+    int flags = ::fcntl(fd, F_GETFL);
+    if (flags < 0) {
+        USBADP_LOG(ERROR, "[USBAdp] fcntl failed.\n");
+        return false;
+    }
+    USBADP_LOG(INFO, "[USBAdp] fdPrn flags: %#x\n", flags);
+    if (flags & O_NONBLOCK) {
+        if (::fcntl(fd, F_SETFL, flags & ~O_NONBLOCK) < 0) {
+            USBADP_LOG(ERROR, "[USBAdp] Fcntl failed\n");
+            return false;
+        }
+        USBADP_LOG(INFO, "[USBAdp] FdPrn flags: %#x\n", ::fcntl(fd, F_GETFL));
+    }
+
+    if (::ioctl(fd, IOCNR_GET_MFP_TO, &stMFP_To) < 0) {
+        USBADP_LOG(ERROR, "[USBAdp]ioctl failed.\n");
+        return false;
+    }
+    stMFP_To.ul_prn_read_to = PRN_READ_TIMEOUT;
+    if (::ioctl(fd, IOCNR_SET_MFP_TO, &stMFP_To) < 0) {
+        USBADP_LOG(ERROR, "[USBAdp]ioctl failed.\n");
+        return false;
+    }
+    return true;
+}
+
+void USBAdapter_SetDefaultSerial(void) { setDefaultSerial(); }
+
+bool USBAdapter_SendIdentity(bool quietBackup) {
+    if (SysPBA_IO_GPOInitBackUp() == 0) {
+        if (quietBackup)
+            USBADP_LOG(FINE, "[USBAdp]GPO Value Successfully Backed Up\n");
+        else
+            USBADP_LOG(INFO, "[USBAdp]GPO Value Successfully Backed Up\n");
+    } else if (quietBackup) {
+        USBADP_LOG(FINE, "[USBAdp]GPO Value backUp Failed\n");
+    } else {
+        USBADP_LOG(ERROR, "[USBAdp]GPO Value backUp Failed\n");
+    }
+    bool ok = true;
+    if (MfpDevSetDesc() == -1) {
+        USBADP_LOG(ERROR, "[USBAdp]MfpDevSetDesc failed.\n");
+        ok = false;
+    }
+    if (USBADP_SetSerialNumber() == -1) {
+        USBADP_LOG(ERROR, "[USBAdp]USBADP_SetSerialNumber failed\n");
+        ok = false;
+    }
+    return ok;
 }
 
 void Initialization(void) {
@@ -478,64 +567,7 @@ void Initialization(void) {
         if (fdPrn < 0) USBADP_LOG(ERROR, "[USBAdp]Cannot open the device file of print, errno:%d\n", errno);
     }
     USBADP_LOG(INFO, "[USBAdp] Initialization =====> USB DEVICE OPEN - Print : [%d]\n", fdPrn.load());
-
-    // The handler logs through the deferred path, whose worker must exist first.
-    Log_StartDeferredWorker();
-    struct sigaction sa;
-    std::memset(&sa, 0, sizeof sa);
-    sa.sa_handler = PrnScanSighandler;
-    if (int r = sigemptyset(&sa.sa_mask); r < 0) {
-        USBADP_LOG(ERROR, "[USBAdp]Error in sigemptyset for print. return value of sigemptyset is %ld\n",
-                   static_cast<long>(r));
-        return;
-    }
-    if (int r = sigaction(SIGIO, &sa, nullptr); r < 0) {
-        USBADP_LOG(ERROR, "[USBAdp][scan thread] sigaction failed for print. return value of sigaction is %ld\n",
-                   static_cast<long>(r));
-        return;
-    }
-
-    const int fd = fdPrn.load();
-    if (fd < 0) {
-        USBADP_LOG(ERROR, "[USBAdp]Error in opening file: %s\n", MS_PRN_FILE_NAME);
-        fdPrn = 0;  // so that a later set-up opens the node again
-        return;
-    }
-    // Asynchronous notification with the flags of descriptor 0, as the bridge
-    // set-up has always done.
-    if (::fcntl(fd, F_SETOWN, ::getpid()) < 0 || ::fcntl(fd, F_GETFL) < 0) {
-        USBADP_LOG(ERROR, "[USBAdp]fcntl failed.\n");
-        return;
-    }
-    int stdinFlags = ::fcntl(0, F_GETFL);
-    if (stdinFlags < 0 || ::fcntl(fd, F_SETFL, stdinFlags | FASYNC) < 0) {
-        USBADP_LOG(ERROR, "[USBAdp]fcntl failed.\n");
-        return;
-    }
-
-    int flags = ::fcntl(fd, F_GETFL);
-    if (flags < 0) {
-        USBADP_LOG(ERROR, "[USBAdp] fcntl failed.\n");
-        return;
-    }
-    USBADP_LOG(INFO, "[USBAdp] fdPrn flags: %#x\n", flags);
-    if (flags & O_NONBLOCK) {
-        if (::fcntl(fd, F_SETFL, flags & ~O_NONBLOCK) < 0) {
-            USBADP_LOG(ERROR, "[USBAdp] Fcntl failed\n");
-            return;
-        }
-        USBADP_LOG(INFO, "[USBAdp] FdPrn flags: %#x\n", ::fcntl(fd, F_GETFL));
-    }
-
-    if (::ioctl(fd, IOCNR_GET_MFP_TO, &stMFP_To) < 0) {
-        USBADP_LOG(ERROR, "[USBAdp]ioctl failed.\n");
-        return;
-    }
-    stMFP_To.ul_prn_read_to = PRN_READ_TIMEOUT;
-    if (::ioctl(fd, IOCNR_SET_MFP_TO, &stMFP_To) < 0) {
-        USBADP_LOG(ERROR, "[USBAdp]ioctl failed.\n");
-        return;
-    }
+    if (!USBAdapter_PreparePrnNode()) return;
 
     std::memset(aub_serial_str, 0, sizeof aub_serial_str);
     if (checkMachineSerialinConf() == 0) {
@@ -555,13 +587,7 @@ void Initialization(void) {
         USBADP_LOG(INFO, "[USBAdp]USB Serial ID found Invalid and Default is Set [%s]\n", aub_serial_str);
     }
 
-    if (SysPBA_IO_GPOInitBackUp() == 0)
-        USBADP_LOG(INFO, "[USBAdp]GPO Value Successfully Backed Up\n");
-    else
-        USBADP_LOG(ERROR, "[USBAdp]GPO Value backUp Failed\n");
-
-    if (MfpDevSetDesc() == -1) USBADP_LOG(ERROR, "[USBAdp]MfpDevSetDesc failed.\n");
-    if (USBADP_SetSerialNumber() == -1) USBADP_LOG(ERROR, "[USBAdp]USBADP_SetSerialNumber failed\n");
+    USBAdapter_SendIdentity(false);
     USBADP_LOG(INFO, "[USBAdp]Exited Initialization(), fdPrn:%d\n", fdPrn.load());
 }
 

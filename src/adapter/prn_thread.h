@@ -44,3 +44,14 @@ void USBAdapter_ReadPass(void);
 // What the loop does when it parks (cable pulled, channel closing): an open
 // job ends with whatever it holds.
 void USBAdapter_EndJobOnPark(void);
+
+// Set-up steps shared by Initialization and the re-open after hibernation.
+// Signal handler, owner and asynchronous flags, blocking reads and the read
+// time-out of the open print node; false at the first failure (logged).
+bool USBAdapter_PreparePrnNode(void);
+// aub_serial_str = the default serial number.
+void USBAdapter_SetDefaultSerial(void);
+// Output-port backup, descriptors (and connect) and the serial-number record;
+// false when the descriptors or the serial record failed. quietBackup logs
+// the backup at level FINE.
+bool USBAdapter_SendIdentity(bool quietBackup);

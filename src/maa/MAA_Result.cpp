@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "adapter/ProductConfig.h"
 #include "adapter/USB.h"
 #include "common/ByteOrder.h"
 #include "common/FixedPath.h"
@@ -25,9 +26,6 @@ TMAAResult stMAASysResult;
 
 namespace {
 
-// Product configuration: the model series written behind the serial number.
-constexpr char kModelSeriesSuffix[] = "\tTW-M4000 Series";
-static_assert(sizeof kModelSeriesSuffix - 1 == 16, "the suffix is 16 characters");
 constexpr size_t kSerialStringSize = 40;
 
 // Lines of Dump_File. Not the session's line buffer: the parser may still be
@@ -207,8 +205,8 @@ void MAA_WriteSerialString(const char *serial) {
         return;
     }
     // The serial is cut, never the suffix.
-    constexpr int kSerialRoom = static_cast<int>(kSerialStringSize - sizeof kModelSeriesSuffix);
-    int n = std::snprintf(text, kSerialStringSize, "%.*s%s", kSerialRoom, serial ? serial : "", kModelSeriesSuffix);
+    constexpr int kSerialRoom = static_cast<int>(kSerialStringSize - sizeof kProductSeriesName - 1);
+    int n = std::snprintf(text, kSerialStringSize, "%.*s\t%s", kSerialRoom, serial ? serial : "", kProductSeriesName);
     const std::string path = FixedPath(REPORT_FILE);
     UniqueFd fd(::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644));
     if (!fd || n < 0 || ::write(fd.get(), text, static_cast<size_t>(n)) != n)

@@ -420,3 +420,27 @@ TEST_F(Simulator, ScanPacketsAndCapabilityRepliesAreCheckedByTypeAndBytes) {
         EXPECT_NE(output_.find(why), std::string::npos);
     }
 }
+
+TEST_F(Simulator, HibernationEndsTheOpenJobAndTheHostSeesTheStagedIdentity) {
+    const std::string partial = kUel + PrintData(600, 11);  // the closing UEL never comes
+    const std::string next = UelJob(PrintData(400, 12));
+    WriteFile(Path("partial.prn"), partial);
+    WriteFile(Path("next.prn"), next);
+
+    ASSERT_EQ(RunScript("host-view\nvendor-answer trayInfo1 hex:010203\nvendor-request 0x0A 0 0\n"
+                        "send prn file:partial.prn\nwait-idle\nexpect-jobs 0\nhibernate\nwake\nexpect-jobs 1\n"
+                        "send prn file:next.prn\nexpect-jobs 2\n",
+                        {"--model", "tw-m4020CDN Office"}),
+              0);
+
+    auto view = Events("sim", "host-view").at(0);
+    EXPECT_EQ(view["ids"], "0x2f3a:0x0121 lang 0x0409");
+    EXPECT_EQ(view["productSize"], std::to_string(std::string("tw-m4020CDN Office").size() + 1));
+    EXPECT_EQ(view["serialRecord"], view["serial"]);
+    EXPECT_NE(view["deviceId"].find(";MDL:tw-m4020CDN Office;"), std::string::npos);
+    EXPECT_NE(view["deviceId"].find("CID:NV_PCL6_Color;STATUS:IDLE;"), std::string::npos);
+    EXPECT_EQ(Events("sim", "vendor-record").at(0)["hex"], "010203");
+    EXPECT_EQ(Events("sim", "wake").at(0)["configured"], "1");
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), partial);
+    EXPECT_EQ(ReadFile(Out("job-002.prn")), next);
+}

@@ -7,7 +7,10 @@
 
 #include <gtest/gtest.h>
 
+#include <atomic>
+#include <chrono>
 #include <fstream>
+#include <thread>
 #include <string>
 #include <vector>
 
@@ -50,6 +53,39 @@ inline mfp_notif_t Notification(U8 code) {
 // Waits until `job` holds `bytes` bytes.
 inline bool AwaitJobBytes(int job, long long bytes, int ms = 10000) {
     return WaitUntil([&] { return fixtures::JobCount() > job && fixtures::JobByteCount(job) == bytes; }, ms);
+}
+
+// USBPrintDrvClose on a thread of its own, as the Java service calls it. The
+// reader's idle poll is cut short once the close has asked it to park.
+inline jint Hibernate(jobject service) {
+    std::atomic<jint> r{-1};
+    std::atomic<bool> done{false};
+    const auto closeRequests = [] {
+        int n = 0;
+        for (const auto &l : LoggerHost_Captured()) n += l.text.find("[USBAdp] USBAdapter_IF_PrintClose start") == 0;
+        return n;
+    };
+    const int closes = closeRequests();
+    std::thread nudge([&] {
+        if (!WaitUntil([&] { return done || closeRequests() > closes; })) return;
+        // Only a poll under way is cut: a time-out left over would end the
+        // wait of a later poll.
+        while (!done) {
+            if (vdev::PollsInProgress(vdev::kPrn) > 0) vdev::ExpirePoll(vdev::kPrn);
+            std::this_thread::sleep_for(std::chrono::milliseconds(100));
+        }
+    });
+    jvm::RunOnThread([&](JNIEnv *) { r = jvm::CallInt(service, "USBPrintDrvClose", "()I"); }, "hibernate");
+    done = true;
+    nudge.join();
+    return r;
+}
+
+// USBPrintDrvOpen on a thread of its own.
+inline jint Wake(jobject service) {
+    std::atomic<jint> r{-1};
+    jvm::RunOnThread([&](JNIEnv *) { r = jvm::CallInt(service, "USBPrintDrvOpen", "()I"); }, "wake");
+    return r;
 }
 
 }  // namespace printjvm

@@ -1,6 +1,9 @@
 // The script commands. Every wait is bounded by the session's time-out and
 // watches the library's own progress: vdev's records of host transfers and
 // polls, the reader thread's blocking call, the Java side's journal.
+#include <atomic>
+#include <cerrno>
+#include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <memory>
@@ -666,6 +669,161 @@ bool ExpectCapability(Session &s, const Args &a, std::string *error) {
     return Expect(s, line, got == want, "read back " + Hex(got) + ", expected " + Hex(want), error);
 }
 
+// ---- what the host sees of the device ------------------------------------------------
+
+std::string CText(const vendor_cmd_t &r) {
+    // The staged data up to its last non-zero byte.
+    size_t n = sizeof r.data;
+    while (n > 0 && r.data[n - 1] == 0) --n;
+    return std::string(reinterpret_cast<const char *>(r.data), n);
+}
+
+bool ParseWord(const std::string &text, unsigned long max, unsigned long *value) {
+    if (text.empty()) return false;
+    char *end = nullptr;
+    errno = 0;
+    unsigned long v = std::strtoul(text.c_str(), &end, 0);
+    if (errno != 0 || *end != 0 || v > max || text[0] == '-') return false;
+    *value = v;
+    return true;
+}
+
+bool CheckVendorRequest(const Args &a, std::string *error) {
+    unsigned long v;
+    for (size_t i = 0; i < a.size(); ++i) {
+        if (!ParseWord(a[i], i == 0 ? 0xFF : 0xFFFF, &v)) {
+            *error = "not a " + std::string(i == 0 ? "byte" : "16-bit number") + ": '" + a[i] + "'";
+            return false;
+        }
+    }
+    return true;
+}
+
+bool HostView(Session &s, const Args &, std::string *error) {
+    auto d = vdev::LastDescriptor();
+    if (!d) {
+        *error = "no descriptors staged yet (is the print node set up?)";
+        return false;
+    }
+    char ids[64];
+    std::snprintf(ids, sizeof ids, "0x%04x:0x%04x lang 0x%04x", d->param.uwVid, d->param.uwPid, d->param.uwLangID);
+    JsonLine line("host-view");
+    line.Str("ids", ids)
+        .Str("manufacturer", d->manufacturer)
+        .Num("manufacturerSize", d->param.ubMf_string_size)
+        .Str("product", d->product)
+        .Num("productSize", d->param.ubPd_string_size)
+        .Str("serial", d->serial)
+        .Num("serialSize", d->param.ubSerial_string_size)
+        .Str("deviceId", d->deviceId)
+        .Num("deviceIdSize", d->param.uwDev_id_1284_size);
+    if (auto r = vdev::HostVendorRequest(0x49, 0, 1)) line.Str("serialRecord", CText(*r));
+    if (auto c = vdev::ConnectState()) line.Num("connect", *c);
+    s.Sim(line);
+    return true;
+}
+
+bool VendorRequest(Session &s, const Args &a, std::string *error) {
+    unsigned long req = 0, value = 0, index = 0;
+    ParseWord(a[0], 0xFF, &req);
+    ParseWord(a[1], 0xFFFF, &value);
+    ParseWord(a[2], 0xFFFF, &index);
+    s.Host(JsonLine("vendor-request").Num("bRequest", static_cast<long long>(req))
+               .Num("wValue", static_cast<long long>(value)).Num("wIndex", static_cast<long long>(index)));
+    auto r = vdev::HostVendorRequest(static_cast<uint8_t>(req), static_cast<uint16_t>(value),
+                                     static_cast<uint16_t>(index));
+    if (!r) {
+        *error = "nothing staged for this request";
+        return false;
+    }
+    const std::string data = CText(*r);
+    s.Sim(JsonLine("vendor-record").Num("bytes", static_cast<long long>(data.size())).Str("hex", Hex(data)));
+    return true;
+}
+
+// Calls an int method without arguments of the service on a thread of its own,
+// as the Java service does. With `nudge` the reader's waits are cut short while
+// the call is under way, so a close does not wait out a poll period.
+bool CallServiceInt(Session &s, const char *method, bool nudge, jint *result, std::string *error) {
+    std::atomic<bool> done{false};
+    std::string ex;
+    jobject service = s.service;
+    std::thread call([&] {
+        JNIEnv *env = Env(method);
+        jclass cls = env->GetObjectClass(service);
+        jmethodID mid = env->GetMethodID(cls, method, "()I");
+        env->DeleteLocalRef(cls);
+        if (!mid) {
+            ex = TakeException(env);
+        } else {
+            *result = env->CallIntMethod(service, mid);
+            ex = TakeException(env);
+        }
+        Vm()->DetachCurrentThread();
+        done = true;
+    });
+    const bool finished = WaitUntil(
+        [&] {
+            if (!done && nudge && vdev::PollsInProgress(vdev::kPrn) > 0)
+                vdev::ExpirePoll(vdev::kPrn);
+            return done.load();
+        },
+        s.timeoutMs);
+    if (!finished) {
+        call.detach();
+        *error = std::string(method) + " did not return";
+        return false;
+    }
+    call.join();
+    if (!ex.empty()) {
+        *error = std::string(method) + " threw " + ex;
+        return false;
+    }
+    return true;
+}
+
+bool Hibernate(Session &s, const Args &, std::string *error) {
+    jint r = -1;
+    if (!CallServiceInt(s, "USBPrintDrvClose", true, &r, error)) return false;
+    s.Sim(JsonLine("hibernate").Num("result", r));
+    if (r == 1) return true;
+    *error = "USBPrintDrvClose answered " + std::to_string(r);
+    return false;
+}
+
+bool Wake(Session &s, const Args &, std::string *error) {
+    jint r = -1, configured = -1;
+    if (!CallServiceInt(s, "USBPrintDrvOpen", false, &r, error)) return false;
+    if (!CallServiceInt(s, "USBPrintDrvOpenChk", false, &configured, error)) return false;
+    s.Sim(JsonLine("wake").Num("result", r).Num("configured", configured));
+    if (r == 1) return true;
+    *error = "USBPrintDrvOpen answered " + std::to_string(r);
+    return false;
+}
+
+bool CheckVendorAnswer(const Args &a, std::string *error) {
+    return CheckDataItems(a.begin() + 1, a.end(), error);
+}
+
+// The status service's answer through its Java entry, as the service stages it.
+bool VendorAnswer(Session &s, const Args &a, std::string *error) {
+    std::string bytes;
+    if (!Data(s, a.begin() + 1, a.end(), &bytes, error)) return false;
+    const bool plugin = a[0] == "extInfo";
+    jobject obj = NewObject(s.env,
+                            plugin ? "com/tarnwel/vbk/ca/plugin/usbadapter/USBAdapter"
+                                   : "com/tarnwel/vbk/common/qz/services/usbadapter/USBAdapterKivoropnlAndDACJNIService",
+                            error);
+    if (!obj) return false;
+    jbyteArray arr = s.env->NewByteArray(static_cast<jsize>(bytes.size()));
+    s.env->SetByteArrayRegion(arr, 0, static_cast<jsize>(bytes.size()), reinterpret_cast<const jbyte *>(bytes.data()));
+    const bool ok = CallVoid(s.env, obj, a[0].c_str(), "([B)V", error, arr);
+    s.env->DeleteLocalRef(arr);
+    s.env->DeleteGlobalRef(obj);
+    if (ok) s.Sim(JsonLine("vendor-answer").Str("method", a[0]).Num("bytes", static_cast<long long>(bytes.size())));
+    return ok;
+}
+
 const std::vector<Command> kCommands = {
     {"plug", "",
      "the host configures the device (MFP_DEV_CONFIGURED); the first time, waits until the print reader reads", 0, 0,
@@ -736,6 +894,18 @@ const std::vector<Command> kCommands = {
     {"scanner-answer", "TEXT", "the scanner driver answers every scanner-side test with one final record TEXT", 1, 1,
      nullptr, ScannerAnswer},
     {"fax-answer", "TEXT", "the fax driver answers every fax-side test with TEXT", 1, 1, nullptr, FaxAnswer},
+    {"host-view", "", "prints the descriptors, serial number (also its vendor record) and Device ID staged in the bridge",
+     0, 0, nullptr, HostView},
+    {"vendor-answer", "METHOD DATA...",
+     "the status service stages DATA through its Java entry METHOD (KivoroSize, trayInfo1, extInfo, ...)", 2, -1,
+     CheckVendorAnswer, VendorAnswer},
+    {"vendor-request", "BREQUEST WVALUE WINDEX",
+     "the host's vendor control request: prints the record staged for it (numbers may be 0x...)", 3, 3,
+     CheckVendorRequest, VendorRequest},
+    {"hibernate", "", "the Java service closes the print channel (USBPrintDrvClose); the reader parks", 0, 0, nullptr,
+     Hibernate},
+    {"wake", "", "the Java service re-opens the print channel (USBPrintDrvOpen) and asks USBPrintDrvOpenChk", 0, 0,
+     nullptr, Wake},
     {"fw-manager", "[MISBEHAVIOUR]",
      "starts the update manager on loopback and points the library at it; again: changes its behaviour "
      "(none, checksum-error, progress-fail, silence, early-close, slow-progress)",

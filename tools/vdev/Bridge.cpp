@@ -233,6 +233,14 @@ std::vector<std::vector<uint8_t>> VendorData() {
     return B().vendorData;
 }
 
+std::optional<vendor_cmd_t> HostVendorRequest(uint8_t bRequest, uint16_t wValue, uint16_t wIndex) {
+    std::lock_guard lk(detail::ModelMutex());
+    const auto &recs = B().vendorRecords;
+    for (auto it = recs.rbegin(); it != recs.rend(); ++it)
+        if (it->bRequest == bRequest && it->wValue == wValue && it->wIndex == wIndex) return *it;
+    return std::nullopt;
+}
+
 void QueueVendorRequest(const uint8_t (&req)[VENDOR_REQ_SIZE]) {
     std::lock_guard lk(detail::ModelMutex());
     std::array<uint8_t, VENDOR_REQ_SIZE> a;

@@ -148,6 +148,11 @@ std::optional<uint8_t> PortStatus();                  // IOCNR_SET_PORT_STATUS
 std::vector<uint8_t> VendorCommands();
 std::vector<vendor_cmd_t> VendorRecords();
 std::vector<std::vector<uint8_t>> VendorData();       // IOCNR_SET_VENDOR_REQ payloads
+// What a host's vendor control request (bRequest, wValue, wIndex) is answered
+// with: the newest record staged with IOCNR_SET_DEV_VENDOR for exactly that
+// triple (the model's matching; the real driver's is its own). Nothing when no
+// such record was staged since Reset().
+std::optional<vendor_cmd_t> HostVendorRequest(uint8_t bRequest, uint16_t wValue, uint16_t wIndex);
 // Answers for IOCNR_GET_VENDOR_REQ, and for IOCNR_GET_CMD_SCAN / WAIT_CMD_SCAN,
 // oldest first. An empty queue: GET fails with EAGAIN; WAIT blocks until one is
 // queued (ETIMEDOUT after ul_scan_read_to, EAGAIN with O_NONBLOCK).
