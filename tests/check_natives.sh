@@ -1,15 +1,13 @@
 #!/bin/sh
 # Fails when a native method declared in a Java class is not exported by
 # libusbadapter.so under its JNI name (so Java would throw UnsatisfiedLinkError).
-# usage: check_natives.sh NM LIBRARY JAVA_SOURCE_ROOT [METHODS_NOT_YET_BUILT]
-# The last argument is an extended regular expression of method names to skip.
-nm_tool=$1 lib=$2 root=$3 pending=${4:-^$}
+# usage: check_natives.sh NM LIBRARY JAVA_SOURCE_ROOT
+nm_tool=$1 lib=$2 root=$3
 syms=$("$nm_tool" -D --defined-only "$lib" | awk '{print $NF}') || exit 1
 missing=0 count=0
 for f in $(find "$root" -name '*.java'); do
   cls=$(printf '%s' "${f#$root/}" | sed 's/\.java$//; s|/|_|g')
   for m in $(sed -n 's/.*[[:space:]]native[[:space:]].*[[:space:]]\([A-Za-z0-9]*\)(.*/\1/p' "$f"); do
-    if printf '%s\n' "$m" | grep -qE "$pending"; then continue; fi
     count=$((count + 1))
     sym="Java_${cls}_${m}"
     if ! printf '%s\n' "$syms" | grep -qx "$sym"; then
