@@ -142,7 +142,7 @@ TEST_P(SerialFromDaemon, ReachesTheHostOrFallsBackToTheDefault) {
     ASSERT_TRUE(rec);
     EXPECT_EQ(std::string(reinterpret_cast<const char *>(rec->data)), c.usb);
     // The model's row of the product table.
-    EXPECT_EQ(d->param.uwPid, 0x0160);
+    EXPECT_EQ(U16{d->param.uwPid}, 0x0160);
     EXPECT_EQ(d->deviceId,
               "MFG:Tarnwel;CMD:PCL5E,PCL6,POSTSCRIPT,FAX,FWV,QMDS,EXT,SBC;MDL:TW-4020 MFP;CLS:printer;"
               "MODE:QML7,SCN;CID:NV_PCL6_BW;STATUS:IDLE;");

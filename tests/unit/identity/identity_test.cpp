@@ -118,13 +118,13 @@ TEST_F(Identity, DescriptorRequestCarriesIdsStringsAndSizesWithTheirNul) {
         ASSERT_EQ(MfpDevSetDesc(), 0) << c.model;
         auto d = vdev::LastDescriptor();
         ASSERT_TRUE(d) << c.model;
-        EXPECT_EQ(d->param.uwVid, DEV_VENDOR_ID);
-        EXPECT_EQ(d->param.uwPid, c.pid) << c.model;
-        EXPECT_EQ(d->param.uwLangID, 0x0409);
+        EXPECT_EQ(U16{d->param.uwVid}, DEV_VENDOR_ID);
+        EXPECT_EQ(U16{d->param.uwPid}, c.pid) << c.model;
+        EXPECT_EQ(U16{d->param.uwLangID}, 0x0409);
         EXPECT_EQ(d->param.ubMf_string_size, std::strlen("Tarnwel Electronics Co., Ltd.") + 1);
         EXPECT_EQ(d->param.ubPd_string_size, std::strlen(c.model) + 1);
         EXPECT_EQ(d->param.ubSerial_string_size, std::strlen(c.serial) + 1);
-        EXPECT_EQ(d->param.uwDev_id_1284_size, std::strlen(Str(aub_dev1284_str).c_str()) + 1);
+        EXPECT_EQ(U16{d->param.uwDev_id_1284_size}, std::strlen(Str(aub_dev1284_str).c_str()) + 1);
         EXPECT_EQ(d->product, c.model);
         EXPECT_EQ(d->serial, c.serial);
         EXPECT_EQ(d->deviceId, Str(aub_dev1284_str));
@@ -150,7 +150,7 @@ TEST_F(Identity, MaaVariantUsesTheDefaultProductIdAndDoesNotConnect) {
     Put(aub_pd_string, "TW-M4020cdn");
     ASSERT_EQ(MAAMfpDevSetDesc(), 0);
     ASSERT_TRUE(vdev::LastDescriptor());
-    EXPECT_EQ(vdev::LastDescriptor()->param.uwPid, DEV_PRODUCT_ID);
+    EXPECT_EQ(U16{vdev::LastDescriptor()->param.uwPid}, DEV_PRODUCT_ID);
     EXPECT_FALSE(vdev::ConnectState());
     EXPECT_TRUE(LoggerHost_Contains("Setting Descriptors Request made successfully to driver."));
 }
