@@ -454,15 +454,18 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     CHECK(!java.jobOpen, "a job was never ended");
     CHECK(vdev::PendingHostBytes(vdev::kPrn) == 0, "host bytes left unread");
 
-    // Nothing is delivered that the host did not send: only a short ESC 0x91
-    // header is padded with zeros (at most 14 per header).
-    const size_t padding = 14 * count(host, std::string_view("\x1b\x91", 2));
+    // Nothing is delivered that the host did not send, but a header read short
+    // is passed on zero-padded: at most 14 bytes per ESC 0x91 header, 6 per
+    // scan-to-application header, 2 per PC-scan or light operation code.
+    const size_t idsHeaders = count(host, std::string_view("\x1b\x91", 2));
+    const size_t scan2App = count(host, std::string_view("\x1b\x9a", 2));
+    const size_t opCodes = count(host, std::string_view("\x1b\xa8", 2)) + count(host, std::string_view("\x1b\xaa", 2));
+    const size_t padding = 14 * idsHeaders + 6 * scan2App + 2 * opCodes;
     CHECK(java.printed.size() + java.appBytes <= host.size() + padding, "more bytes delivered than the host sent");
     // Application transfers come only from an application header (ESC 0x91) or
     // a scan-protocol packet the print channel also serves.
-    const bool appSelector = count(host, std::string_view("\x1b\x9a", 2)) + count(host, std::string_view("\x1b\xa8", 2)) +
-                                 count(host, std::string_view("\x1b\xaa", 2)) > 0;
-    if (padding == 0) {
+    const bool appSelector = scan2App + opCodes > 0;
+    if (idsHeaders == 0) {
         if (!appSelector) CHECK(java.appEvents == 0, "an application transfer without an application header");
         CHECK(isSubsequence(java.printed, host), "print data not in the order the host sent it");
     }
