@@ -4,12 +4,14 @@
 # staged package alone. Host builds run it (a real call into the library);
 # cross builds check its machine and, given an emulator, let the loader bind it.
 # usage: check_install.sh BUILD STAGE CONSUMER NM CHECK_EXPORTS VERSION
-#        WINDOW_DATA_SIZE DEV_ID_MAX_SIZE GENERATOR [TOOLCHAIN MACHINE [EMULATOR...]]
+#        WINDOW_DATA_SIZE DEV_ID_MAX_SIZE GENERATOR HAS_JAR [TOOLCHAIN MACHINE [EMULATOR...]]
 set -eu
 build=$1 stage=$2 consumer=$3 nm_tool=$4 check_exports=$5 version=$6 window=$7 devid=$8 generator=$9
-shift 9
+has_jar=${10}
+shift 10
 toolchain=${1:-} machine=${2:-}
 [ $# -ge 2 ] && shift 2 || shift $#
+emulator=$*  # word-split when run: no blanks in its arguments
 fail() { echo "FAIL: $*" >&2; exit 1; }
 
 rm -rf "$stage"
@@ -25,7 +27,7 @@ soname=$(readelf -d "$lib" | sed -n 's/.*(SONAME).*\[\(.*\)\]/\1/p')
 sh "$check_exports" "$nm_tool" "$lib" >/dev/null || { sh "$check_exports" "$nm_tool" "$lib"; fail "exports"; }
 
 set -- -DCMAKE_BUILD_TYPE=Release -DEXPECT_VERSION="$version" \
-  -DEXPECT_WINDOW_DATA_SIZE="$window" -DEXPECT_DEV_ID_MAX_SIZE="$devid"
+  -DEXPECT_WINDOW_DATA_SIZE="$window" -DEXPECT_DEV_ID_MAX_SIZE="$devid" -DEXPECT_JAR="$has_jar"
 if [ -n "$toolchain" ]; then
   # A cross tool chain re-roots search prefixes into its sysroot: name the package directly.
   set -- "$@" -DCMAKE_TOOLCHAIN_FILE="$toolchain" -Dusbadapter_DIR="$libdir/cmake/usbadapter"
@@ -48,6 +50,6 @@ if [ -z "$toolchain" ]; then
   case $(cat "$report") in "SN42	"?*) ;; *) fail "report file: '$(cat "$report")'" ;; esac
 else
   [ "$(machine_of "$exe")" = "$machine" ] || fail "consumer is $(machine_of "$exe"), not $machine"
-  if [ $# -gt 0 ]; then "$@" "$exe" resolve || fail "consumer under $*"; fi
+  if [ -n "$emulator" ]; then $emulator "$exe" resolve || fail "consumer under $emulator"; fi
 fi
 echo "installed $lib ($soname); consumer $(machine_of "$exe") ok"
