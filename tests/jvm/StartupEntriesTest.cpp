@@ -128,7 +128,7 @@ TEST_F(StartupEntries, InitDeviceWithoutQueuesLogsTheFailedSend) {
 // The library that Java loaded must log through the same stand-in the test
 // captures from: one Logger_PrintDelay in the process.
 TEST_F(StartupEntries, LibraryLoadedByJavaSharesTheTestsLogger) {
-    void *lib = dlopen("libusbadapter.so", RTLD_NOLOAD | RTLD_NOW);
+    void *lib = dlopen(USBADAPTER_SONAME, RTLD_NOLOAD | RTLD_NOW);
     ASSERT_NE(lib, nullptr) << "the service class did not load libusbadapter.so";
     void *seenByLibrary = dlsym(lib, "Logger_PrintDelay");
     dlclose(lib);

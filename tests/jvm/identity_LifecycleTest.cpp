@@ -162,7 +162,7 @@ INSTANTIATE_TEST_SUITE_P(
 using Setter = TMAAResult *(*)(U8 *);
 
 Setter Exported(const char *name) {
-    void *lib = ::dlopen("libusbadapter.so", RTLD_NOW | RTLD_NOLOAD);
+    void *lib = ::dlopen(USBADAPTER_SONAME, RTLD_NOW | RTLD_NOLOAD);
     return lib ? reinterpret_cast<Setter>(::dlsym(lib, name)) : nullptr;
 }
 
