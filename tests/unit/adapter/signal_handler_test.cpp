@@ -209,7 +209,7 @@ TEST_F(SignalHandler, RunsSafelyWhileAnotherThreadIsLogging) {
         pthread_kill(loggerThread.load(), SIGIO);
         // Drain as we go so the print queue never fills up, nor the deferred
         // log queue when the busy logger starves its worker on a loaded machine.
-        for (int k = 0; k < 100 && !Print(); ++k) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        for (int k = 0; k < 2000 && !Print(); ++k) std::this_thread::sleep_for(std::chrono::milliseconds(1));
         Log_FlushDeferred();
     }
     stop = true;

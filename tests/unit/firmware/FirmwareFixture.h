@@ -173,7 +173,7 @@ protected:
         std::filesystem::remove_all(dir_, ec);
     }
 
-    static constexpr int kShortWaitMs = 150;
+    static constexpr int kShortWaitMs = 400;
 
     // What the host sent and nobody has read yet (the print reader's).
     std::string TakePending() {

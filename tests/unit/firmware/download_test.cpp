@@ -327,6 +327,9 @@ TEST_F(FirmwareTest, ClassifierReportsTheDownloadAndTheReaderGoesOn) {
 // A process survives many firmware files, successful or refused.
 TEST_F(FirmwareTest, ThousandDownloadsLeaveNoDescriptorBehind) {
     StartManager();
+    // The manager answers at once; only a loaded machine is slow, and a
+    // time-out here would count as a failed download.
+    UpdateManager_SetWaitMs(2000);
     const std::vector<Image> images = {{"E7", Body(64, 13)}, {"E1", Body(33, 14)}};
     QuietStdout quiet;
     DownloadImages(images);  // first use may open what stays for good (logging)

@@ -179,7 +179,7 @@ TEST_F(PanelTest, WithoutAnAnswerTheHeaderIsTheLastRecord) {
         usePort(server.port());
         const auto start = std::chrono::steady_clock::now();
         EXPECT_EQ(hostSees(c.call), (std::vector<Record>{cont(c.header), cont(c.header)}));
-        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(2));
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));  // not the operator's minutes
         EXPECT_EQ(server.requests().size(), 1u);
     }
 }
