@@ -15,6 +15,7 @@
 #include "FirmwareCommands.h"
 #include "Host.h"
 #include "Script.h"
+#include "Serve.h"
 #include "Sha256.h"
 #include "ShellCommands.h"
 #include "UiPeer.h"
@@ -887,6 +888,11 @@ const std::vector<Command> kCommands = {
      "hands the print channel to a host tool: a pseudo-terminal, LINK a symbolic link to it, opened as a printer's "
      "device node; returns when the tool has closed it",
      2, 2, CheckPty, Pty},
+    {"serve", "[prn LINK] [scan LINK]",
+     "the simulated printer for host software: each channel at LINK (default: prn at OUT/prn), a pseudo-terminal "
+     "that stays there through any number of host opens and closes; a close ends the print job it carried; runs "
+     "until SIGINT or SIGTERM",
+     0, 4, CheckServe, Serve},
     {"ui-server", "ANSWER|stop",
      "starts the operator panel's UI server on 127.0.0.1, answering every panel test with ANSWER (e.g. 9); stop "
      "ends it and journals the requests it received",
