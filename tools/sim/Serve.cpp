@@ -16,6 +16,9 @@
 #include <deque>
 #include <fstream>
 #include <memory>
+#include <mutex>
+#include <thread>
+#include <utility>
 
 #include "FirmwareCommands.h"
 #include "Host.h"
@@ -45,25 +48,28 @@ struct Pty {
     int master = -1, keep = -1, watch = -1;
     std::string slave;
     int hosts = 0;            // host descriptors open on it now
-    bool opened = false;      // a host has opened it
     long long session = 0;
     long long sent = 0, readBack = 0, dropped = 0;
     Sha256 sha;               // of what the host sent
 };
 
-// A channel at a fixed path: a symbolic link to a spare pseudo-terminal. When
-// a host opens it, the link is moved (atomically) to a fresh one, so the next
-// host gets a terminal of its own and the bytes of two sessions never mix,
-// however quickly one follows the other. Sessions are served in the order they
-// opened; a later one waits (its writes block once the terminal's buffer is
-// full) until the earlier one has closed and its job has ended.
+// A channel at a fixed path: a symbolic link to a pseudo-terminal nobody has
+// opened yet. When a host opens it, the link is moved (atomically) to a fresh
+// one, so the next host gets a terminal of its own and the bytes of two
+// sessions never mix. Sessions are served in the order they opened; a later one
+// waits (its writes block once the terminal's buffer is full) until the earlier
+// one has closed and its job has ended.
 struct Port {
     std::string chan;
     const char *node = nullptr;
     std::string link;
-    std::deque<std::unique_ptr<Pty>> ptys;  // sessions in order, the spare last
+    std::deque<std::unique_ptr<Pty>> ptys;  // opened sessions in order
     long long sessions = 0;
+    long long idleDropped = 0;  // device bytes while no session was open
     Clock::time_point progressAt{};
+    // Owned by the watcher while it runs: the terminal the link points to and
+    // the next one, with its link made beside the path, ready to be renamed.
+    std::unique_ptr<Pty> current, spare;
 };
 
 void MakeRaw(int fd) {
@@ -80,8 +86,10 @@ void ClosePty(Pty &t, int inotifyFd) {
     t.watch = t.keep = t.master = -1;
 }
 
-// A fresh spare at the back of the port's list, and the link moved to it.
-bool AddSpare(Port &p, int inotifyFd, std::string *error) {
+std::string NextLink(const Port &p) { return p.link + ".new"; }
+
+// The port's next spare: a watched terminal and a link to it beside the path.
+bool MakeSpare(Port &p, int inotifyFd, std::string *error) {
     auto t = std::make_unique<Pty>();
     t->master = ::posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC);
     bool ok = t->master >= 0 && ::grantpt(t->master) == 0 && ::unlockpt(t->master) == 0;
@@ -97,19 +105,142 @@ bool AddSpare(Port &p, int inotifyFd, std::string *error) {
         t->watch = ::inotify_add_watch(inotifyFd, t->slave.c_str(), IN_OPEN | IN_CLOSE);
         ok = t->watch >= 0;
     }
-    const std::string tmp = p.link + ".new";
+    const std::string next = NextLink(p);
     if (ok) {
-        ::unlink(tmp.c_str());
-        ok = ::symlink(t->slave.c_str(), tmp.c_str()) == 0 && ::rename(tmp.c_str(), p.link.c_str()) == 0;
+        ::unlink(next.c_str());
+        ok = ::symlink(t->slave.c_str(), next.c_str()) == 0;
     }
     if (!ok) {
         *error = "serve: cannot set up a pseudo-terminal at " + p.link + ": " + std::strerror(errno);
         ClosePty(*t, inotifyFd);
         return false;
     }
-    p.ptys.push_back(std::move(t));
+    p.spare = std::move(t);
     return true;
 }
+
+// Points the path at the spare, which becomes current.
+bool Advance(Port &p, std::string *error) {
+    if (!p.spare || ::rename(NextLink(p).c_str(), p.link.c_str()) != 0) {
+        *error = "serve: cannot move " + p.link + ": " + (p.spare ? std::strerror(errno) : "no spare terminal");
+        return false;
+    }
+    p.current = std::move(p.spare);
+    return true;
+}
+
+// What the watcher hands to the main loop, in the order inotify reported it.
+struct HostEvent {
+    enum Kind { kOpen, kClose, kError } kind = kOpen;
+    int watch = -1;
+    size_t port = 0;
+    std::unique_ptr<Pty> session;  // on the first open of a terminal
+    std::string error;
+};
+
+// Moves each port's path on as soon as a host opens its terminal, on a thread
+// of its own: the main loop may be busy ending the last job for a while, and a
+// spooler starts its next backend, which opens the path again, as soon as the
+// last one has exited. The window left is between the host's open and the
+// rename here.
+class Watcher {
+public:
+    Watcher(int inotifyFd, Port *ports, size_t count) : ino_(inotifyFd), ports_(ports), count_(count) {}
+    ~Watcher() { Stop(); }
+
+    bool Start(std::string *error) {
+        if (::pipe2(quit_, O_CLOEXEC | O_NONBLOCK) != 0 || ::pipe2(wake_, O_CLOEXEC | O_NONBLOCK) != 0) {
+            *error = std::string("serve: pipe: ") + std::strerror(errno);
+            return false;
+        }
+        // The stop signals are the main loop's to see.
+        sigset_t block, old;
+        sigemptyset(&block);
+        sigaddset(&block, SIGINT);
+        sigaddset(&block, SIGTERM);
+        ::pthread_sigmask(SIG_BLOCK, &block, &old);
+        thread_ = std::thread([this] { Run(); });
+        ::pthread_sigmask(SIG_SETMASK, &old, nullptr);
+        return true;
+    }
+
+    void Stop() {
+        if (thread_.joinable()) {
+            const char c = 1;
+            [[maybe_unused]] ssize_t n = ::write(quit_[1], &c, 1);
+            thread_.join();
+        }
+        for (int *fds : {quit_, wake_}) {
+            for (int i = 0; i < 2; ++i) {
+                if (fds[i] >= 0) ::close(fds[i]);
+                fds[i] = -1;
+            }
+        }
+    }
+
+    int WakeFd() const { return wake_[0]; }
+
+    std::deque<HostEvent> Take() {
+        char buf[64];
+        while (wake_[0] >= 0 && ::read(wake_[0], buf, sizeof buf) > 0) {
+        }
+        std::lock_guard<std::mutex> lock(mutex_);
+        return std::exchange(events_, {});
+    }
+
+private:
+    void Post(HostEvent ev) {
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            events_.push_back(std::move(ev));
+        }
+        const char c = 1;
+        [[maybe_unused]] ssize_t n = ::write(wake_[1], &c, 1);
+    }
+
+    void Run() {
+        bool failed = false;
+        while (!failed) {
+            pollfd fds[2] = {{quit_[0], POLLIN, 0}, {ino_, POLLIN, 0}};
+            if (::poll(fds, 2, -1) < 0 && errno != EINTR) return;
+            if (fds[0].revents != 0) return;
+            alignas(inotify_event) char buf[4096];
+            const ssize_t n = ::read(ino_, buf, sizeof buf);
+            for (ssize_t off = 0; n > 0 && off + static_cast<ssize_t>(sizeof(inotify_event)) <= n && !failed;) {
+                const auto *ev = reinterpret_cast<const inotify_event *>(buf + off);
+                off += static_cast<ssize_t>(sizeof(inotify_event) + ev->len);
+                failed = !Dispatch(*ev);
+            }
+        }
+    }
+
+    bool Dispatch(const inotify_event &ev) {
+        if (ev.mask & IN_OPEN) {
+            for (size_t i = 0; i < count_; ++i) {
+                Port &p = ports_[i];
+                if (!p.current || ev.wd != p.current->watch) continue;
+                HostEvent open{HostEvent::kOpen, ev.wd, i, std::move(p.current), {}};
+                std::string error;
+                const bool ok = Advance(p, &error) && MakeSpare(p, ino_, &error);
+                Post(std::move(open));
+                if (!ok) Post({HostEvent::kError, -1, i, nullptr, error});
+                return ok;
+            }
+            Post({HostEvent::kOpen, ev.wd, 0, nullptr, {}});
+        } else if (ev.mask & IN_CLOSE) {
+            Post({HostEvent::kClose, ev.wd, 0, nullptr, {}});
+        }
+        return true;
+    }
+
+    int ino_;
+    Port *ports_;
+    size_t count_;
+    int quit_[2] = {-1, -1}, wake_[2] = {-1, -1};
+    std::thread thread_;
+    std::mutex mutex_;
+    std::deque<HostEvent> events_;
+};
 
 void EndProgress(Port &p) {
     if (p.progressAt == Clock::time_point{}) return;
@@ -143,7 +274,7 @@ void BackChannel(Session &s, Port &p, Pty *t) {
     std::vector<uint8_t> got = vdev::HostRead(p.node);
     if (got.empty()) return;
     if (!t || t->hosts == 0) {
-        if (t) t->dropped += static_cast<long long>(got.size());
+        (t ? t->dropped : p.idleDropped) += static_cast<long long>(got.size());
         return;
     }
     size_t off = 0;
@@ -224,40 +355,38 @@ void EndSession(Session &s, Port &p, Pty &t, Reported &r) {
 
 // Serves the sessions at the front that their hosts have closed.
 void Retire(Session &s, Port &p, int inotifyFd, Reported &r) {
-    while (p.ptys.size() > 1 && p.ptys.front()->opened && p.ptys.front()->hosts == 0) {
+    while (!p.ptys.empty() && p.ptys.front()->hosts == 0) {
         EndSession(s, p, *p.ptys.front(), r);
         ClosePty(*p.ptys.front(), inotifyFd);
         p.ptys.pop_front();
     }
 }
 
-bool HostEvents(Session &s, int fd, Port *ports, size_t count, std::string *error) {
-    alignas(inotify_event) char buf[4096];
-    for (;;) {
-        ssize_t n = ::read(fd, buf, sizeof buf);
-        if (n <= 0) return true;
-        for (ssize_t off = 0; off < n;) {
-            const auto *ev = reinterpret_cast<const inotify_event *>(buf + off);
-            off += static_cast<ssize_t>(sizeof(inotify_event) + ev->len);
-            for (size_t i = 0; i < count; ++i) {
-                Port &p = ports[i];
-                for (auto &t : p.ptys) {
-                    if (ev->wd != t->watch) continue;
-                    if (ev->mask & IN_OPEN) {
-                        ++t->hosts;
-                        if (t->opened) continue;
-                        t->opened = true;
-                        t->session = ++p.sessions;
-                        s.Host(JsonLine("host-open").Str("chan", p.chan).Num("session", t->session));
-                        if (!AddSpare(p, fd, error)) return false;
-                    } else if ((ev->mask & IN_CLOSE) && t->hosts > 0) {
-                        --t->hosts;
-                    }
-                    break;
-                }
+bool HostEvents(Session &s, Watcher &w, Port *ports, size_t count, std::string *error) {
+    for (HostEvent &ev : w.Take()) {
+        if (ev.kind == HostEvent::kError) {
+            *error = ev.error;
+            return false;
+        }
+        if (ev.session) {
+            Port &p = ports[ev.port];
+            Pty &t = *ev.session;
+            t.hosts = 1;
+            t.session = ++p.sessions;
+            t.dropped = std::exchange(p.idleDropped, 0);
+            s.Host(JsonLine("host-open").Str("chan", p.chan).Num("session", t.session));
+            p.ptys.push_back(std::move(ev.session));
+            continue;
+        }
+        for (size_t i = 0; i < count; ++i) {
+            for (auto &t : ports[i].ptys) {
+                if (ev.watch != t->watch) continue;
+                if (ev.kind == HostEvent::kOpen) ++t->hosts;
+                else if (t->hosts > 0) --t->hosts;
             }
         }
     }
+    return true;
 }
 
 }  // namespace
@@ -306,15 +435,23 @@ bool Serve(Session &s, const Args &a, std::string *error) {
     const int ino = ::inotify_init1(IN_NONBLOCK | IN_CLOEXEC);
     bool ok = ino >= 0;
     if (!ok) *error = std::string("serve: inotify: ") + std::strerror(errno);
-    for (size_t i = 0; ok && i < count; ++i) ok = AddSpare(ports[i], ino, error);
+    for (size_t i = 0; ok && i < count; ++i)
+        ok = MakeSpare(ports[i], ino, error) && Advance(ports[i], error) && MakeSpare(ports[i], ino, error);
     if (ok && gStopPipe[0] < 0) {
         ok = false;
         *error = "serve: no pipe for the stop signals";
     }
+    Watcher watcher(ino, ports, count);
+    ok = ok && watcher.Start(error);
     auto cleanUp = [&] {
+        watcher.Stop();
         for (size_t i = 0; i < count; ++i) {
-            for (auto &t : ports[i].ptys) ClosePty(*t, ino);
-            ::unlink(ports[i].link.c_str());
+            Port &p = ports[i];
+            for (auto &t : p.ptys) ClosePty(*t, ino);
+            for (Pty *t : {p.current.get(), p.spare.get()})
+                if (t) ClosePty(*t, ino);
+            ::unlink(p.link.c_str());
+            ::unlink(NextLink(p).c_str());
         }
         if (ino >= 0) ::close(ino);
     };
@@ -334,15 +471,17 @@ bool Serve(Session &s, const Args &a, std::string *error) {
     Reported reported;
     auto lastReport = Clock::now();
     while (gStopSignal == 0 && ok) {
-        pollfd fds[4] = {{gStopPipe[0], POLLIN, 0}, {ino, POLLIN, 0}};
-        for (size_t i = 0; i < count; ++i) fds[2 + i] = {ports[i].ptys.front()->master, POLLIN, 0};
-        ::poll(fds, static_cast<nfds_t>(2 + count), 10);
-        ok = HostEvents(s, ino, ports, count, error);
+        pollfd fds[4] = {{gStopPipe[0], POLLIN, 0}, {watcher.WakeFd(), POLLIN, 0}};
+        nfds_t n = 2;
+        for (size_t i = 0; i < count; ++i)
+            if (!ports[i].ptys.empty()) fds[n++] = {ports[i].ptys.front()->master, POLLIN, 0};
+        ::poll(fds, n, 10);
+        ok = HostEvents(s, watcher, ports, count, error);
         for (size_t i = 0; ok && i < count; ++i) {
             Retire(s, ports[i], ino, reported);
-            Pty &front = *ports[i].ptys.front();
-            Pump(s, ports[i], front, progress);
-            BackChannel(s, ports[i], &front);
+            Pty *front = ports[i].ptys.empty() ? nullptr : ports[i].ptys.front().get();
+            if (front) Pump(s, ports[i], *front, progress);
+            BackChannel(s, ports[i], front);
         }
         if (Clock::now() - lastReport > std::chrono::milliseconds(200)) {
             Report(s, reported);
@@ -351,9 +490,11 @@ bool Serve(Session &s, const Args &a, std::string *error) {
     }
     s.Sim(JsonLine("serve-stop").Num("signal", gStopSignal));
     // Hosts still on the channel: what they sent so far are whole jobs.
+    watcher.Stop();
+    std::string late;
+    HostEvents(s, watcher, ports, count, &late);
     for (size_t i = 0; i < count; ++i) {
         for (auto &t : ports[i].ptys) {
-            if (!t->opened) continue;
             t->hosts = 0;
             EndSession(s, ports[i], *t, reported);
         }
