@@ -4,6 +4,7 @@
 # service, on virtual devices.
 #   scripts/run.sh                 the sample session (tools/sim/samples/session.sim)
 #   scripts/run.sh ARGS...         usbadapter-sim with these arguments (files, -s, -e, ...)
+#   scripts/run.sh serve           the simulated printer for host software, until Ctrl-C
 set -euo pipefail
 cd "$(dirname "$0")/.."
 cmake --preset default >/dev/null
@@ -15,7 +16,13 @@ args=("$@")
 ((${#args[@]})) || args=(--script tools/sim/samples/session.sim)
 echo "== usbadapter-sim ${args[*]}"
 status=0
-build/default/tools/sim/usbadapter-sim --out "$out" "${args[@]}" || status=$?
+if [ "${args[0]}" = serve ]; then
+  build/default/tools/sim/usbadapter-sim serve --out "$out" "${args[@]:1}" || status=$?
+else
+  build/default/tools/sim/usbadapter-sim --out "$out" "${args[@]}" || status=$?
+fi
 echo "== session journal ($out/session.jsonl)"
 cat "$out/session.jsonl"
+[ "${args[0]}" = serve ] ||
+  echo "== for host software (CUPS, usbadapter-shell): scripts/run.sh serve  (print channel at $out/prn)"
 exit "$status"

@@ -8,7 +8,8 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 
 packages=(cmake ninja-build g++ clang libclang-rt-14-dev googletest libgtest-dev libgmock-dev
-          libbenchmark-dev openjdk-17-jdk-headless bison python3 g++-arm-linux-gnueabihf qemu-user)
+          libbenchmark-dev openjdk-17-jdk-headless bison python3 g++-arm-linux-gnueabihf qemu-user
+          cups cups-client)
 missing=()
 for p in "${packages[@]}"; do
   dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q "install ok installed" || missing+=("$p")

@@ -241,6 +241,42 @@ TEST_F(Simulator, FailedExpectationStopsTheSessionWithStatusOne) {
     EXPECT_NE(output_.find("session FAILED"), std::string::npos);
 }
 
+// A slice of a file at random transfer sizes (the same cuts for the same seed,
+// each within the bounds), state shown without waiting, and failed expectations
+// counted while the script goes on.
+TEST_F(Simulator, SliceAtSeededRandomSizesWithQueriesAndExpectationsThatGoOn) {
+    const std::string body = PrintData(50000, 9), file = "head" + UelJob(body) + "tail";
+    WriteFile(Path("f.bin"), file);
+    const std::string job = UelJob(body);
+    const std::string send = "send prn slice:4:" + std::to_string(job.size()) + ":f.bin chunks random:1-700:7\n";
+
+    ASSERT_EQ(RunScript("set expect continue\n" + send + send + "expect-jobs 3\nshow jobs\nshow job\nshow reader\n"
+                        "expect-job 1 equals slice:4:" + std::to_string(job.size()) + ":f.bin\n"
+                        "expect-jobs 5\nnote still here\nset expect stop\nexpect-jobs 9\nnote not reached\n"),
+              1);
+
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
+    EXPECT_EQ(ReadFile(Out("job-002.prn")), job);
+    auto sends = Events("host", "send");
+    ASSERT_EQ(sends.size(), 2u);
+    EXPECT_EQ(sends[0]["transfers"], sends[1]["transfers"]);
+    EXPECT_GE(std::stoi(sends[0]["transfers"]), static_cast<int>(job.size() / 700));
+    // Two failures counted (3 and 5 jobs), the third stops the script.
+    auto expects = Events("sim", "expect");
+    ASSERT_EQ(expects.size(), 4u);
+    EXPECT_EQ(expects[1]["ok"], "true");
+    EXPECT_EQ(Events("sim", "error").size(), 3u);
+    auto notes = Events("sim", "note");
+    ASSERT_EQ(notes.size(), 1u);
+    EXPECT_EQ(notes[0]["text"], "still here");
+    EXPECT_NE(output_.find("jobs: 2 ended, 0 open\n  job 1: ended " + std::to_string(job.size()) + " bytes"),
+              std::string::npos);
+    EXPECT_NE(output_.find("open job: none"), std::string::npos);
+    EXPECT_NE(output_.find("print reader: polling, device plugged, 0 host bytes not read"), std::string::npos);
+    EXPECT_EQ(RunScript("send prn slice:4:99999:f.bin\n"), 1);  // past the file's end
+    EXPECT_EQ(RunScript("send prn uel chunks random:9-3:1\n"), 2);
+}
+
 TEST_F(Simulator, ScriptErrorsAreRefusedBeforeTheSessionStarts) {
     EXPECT_EQ(RunScript("send prn uel\nsend prn hex:1b2\n"), 2);
     EXPECT_NE(output_.find("session.sim:2"), std::string::npos);

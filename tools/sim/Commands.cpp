@@ -15,6 +15,7 @@
 #include "FirmwareCommands.h"
 #include "Host.h"
 #include "Script.h"
+#include "Serve.h"
 #include "Sha256.h"
 #include "ShellCommands.h"
 #include "UiPeer.h"
@@ -143,7 +144,21 @@ struct SendArgs {
     Args::const_iterator dataEnd;
     std::vector<size_t> chunks;
     size_t every = 0;
+    size_t randomMin = 0, randomMax = 0;  // chunks random:MIN-MAX:SEED
+    uint32_t seed = 0;
 };
+
+bool ParseRandomChunks(const std::string &value, SendArgs *out) {
+    const size_t dash = value.find('-', 7), colon = value.find(':', 7);
+    size_t seed = 0;
+    if (dash == std::string::npos || colon == std::string::npos || colon < dash ||
+        !ParseSize(value.substr(7, dash - 7), &out->randomMin) ||
+        !ParseSize(value.substr(dash + 1, colon - dash - 1), &out->randomMax) ||
+        !ParseSize(value.substr(colon + 1), &seed) || out->randomMax == 0 || out->randomMax < out->randomMin)
+        return false;
+    out->seed = static_cast<uint32_t>(seed);
+    return true;
+}
 
 bool ParseSend(const Args &a, SendArgs *out, std::string *error) {
     auto it = a.begin() + 1;
@@ -160,6 +175,11 @@ bool ParseSend(const Args &a, SendArgs *out, std::string *error) {
         if (key == "every") {
             if (!ParseSize(value, &out->every) || out->every == 0) {
                 *error = "every: a size above 0 expected, not '" + value + "'";
+                return false;
+            }
+        } else if (key == "chunks" && value.rfind("random:", 0) == 0) {
+            if (!ParseRandomChunks(value, out)) {
+                *error = "chunks random:MIN-MAX:SEED with 0 < MAX, MIN <= MAX expected, not '" + value + "'";
                 return false;
             }
         } else if (key == "chunks") {
@@ -227,8 +247,13 @@ bool CheckNotify(const Args &a, std::string *error) {
 }
 
 bool CheckSet(const Args &a, std::string *error) {
+    if (a[0] == "expect") {
+        if (a[1] == "continue" || a[1] == "stop") return true;
+        *error = "set expect: continue or stop";
+        return false;
+    }
     if (a[0] != "timeout") {
-        *error = "unknown setting '" + a[0] + "' (timeout)";
+        *error = "unknown setting '" + a[0] + "' (timeout or expect)";
         return false;
     }
     long long v;
@@ -312,7 +337,9 @@ bool Send(Session &s, const Args &a, std::string *error) {
     if (!ParseSend(a, &parsed, error)) return false;
     std::string bytes;
     if (!Data(s, a.begin() + 1, parsed.dataEnd, &bytes, error)) return false;
-    std::vector<size_t> sizes = SplitTransfers(bytes.size(), parsed.chunks, parsed.every);
+    std::vector<size_t> sizes =
+        parsed.randomMax > 0 ? RandomTransfers(bytes.size(), parsed.randomMin, parsed.randomMax, parsed.seed)
+                             : SplitTransfers(bytes.size(), parsed.chunks, parsed.every);
     const char *path = ChannelPath(a[0]);
     size_t offset = 0;
     for (size_t n : sizes) {
@@ -472,10 +499,67 @@ bool Sleep(Session &s, const Args &a, std::string *error) {
 }
 
 bool Set(Session &s, const Args &a, std::string *error) {
+    if (a[0] == "expect") {
+        s.expectContinue = a[1] == "continue";
+        s.Sim(JsonLine("set").Str("expect", a[1]));
+        return true;
+    }
     long long v = 0;
     if (!ParseCount(a[1], &v, error)) return false;
     s.timeoutMs = static_cast<int>(v);
     s.Sim(JsonLine("set").Num("timeout", v));
+    return true;
+}
+
+bool CheckShow(const Args &a, std::string *error) {
+    if (a[0] == "jobs" || a[0] == "apps" || a[0] == "job" || a[0] == "reader") return true;
+    *error = "show: jobs, apps, job or reader";
+    return false;
+}
+
+const char *WaitName(ThreadWait w) {
+    switch (w) {
+    case ThreadWait::Running: return "running";
+    case ThreadWait::Poll: return "polling";
+    case ThreadWait::Sleep: return "parked";
+    case ThreadWait::Other: return "blocked";
+    default: return "gone";
+    }
+}
+
+// The state as it stands, printed and journalled; waits for nothing.
+bool Show(Session &s, const Args &a, std::string *) {
+    s.SyncJava();
+    JsonLine line("state");
+    line.Str("what", a[0]);
+    if (a[0] == "jobs") {
+        std::printf("jobs: %d ended, %d open\n", s.EndedJobs(), s.OpenJobs());
+        for (const JobRecord &j : s.jobs)
+            std::printf("  job %d: %s %lld bytes  sha256 %s  %s\n", j.number, j.ended ? "ended" : "open", j.bytes,
+                        j.sha256.c_str(), j.file.c_str());
+        line.Num("ended", s.EndedJobs()).Num("open", s.OpenJobs());
+    } else if (a[0] == "apps") {
+        std::printf("application transfers: %d ended of %zu\n", s.EndedApps(), s.apps.size());
+        for (const AppRecord &r : s.apps)
+            std::printf("  app %d (%s): %s %lld bytes  sha256 %s  %s\n", r.number, r.type.c_str(),
+                        r.ended ? "ended" : "open", r.bytes, r.sha256.c_str(), r.file.c_str());
+        line.Num("ended", s.EndedApps()).Num("all", static_cast<long long>(s.apps.size()));
+    } else if (a[0] == "job") {
+        const JobRecord *open = nullptr;
+        for (const JobRecord &j : s.jobs)
+            if (!j.ended) open = &j;
+        if (open) std::printf("open job: %d (%s)\n", open->number, open->name.c_str());
+        else std::printf("open job: none\n");
+        line.Num("open-job", open ? open->number : 0);
+    } else {
+        const char *state = s.ReaderGone() ? "returned" : WaitName(ProbeThread(s.printReader.tid));
+        const long long pending = static_cast<long long>(vdev::PendingHostBytes(vdev::kPrn));
+        std::printf("print reader: %s, device %s, %lld host bytes not read\n", state,
+                    s.plugged ? "plugged" : "unplugged", pending);
+        line.Str("reader", state).Bool("plugged", s.plugged).Num("pending", pending);
+    }
+    std::fflush(stdout);
+    s.Sim(line);
     return true;
 }
 
@@ -834,9 +918,9 @@ const std::vector<Command> kCommands = {
      "queues a bridge notification (configured, disconnect, reset, scan-command or a number; default both) and "
      "waits until the library took it",
      1, 2, CheckNotify, Notify},
-    {"send", "CHAN DATA... [chunks N,M,...] [every N]",
-     "host transfers on CHAN (prn or scan): the data cut at the given sizes, the rest in one transfer; or in "
-     "transfers of N bytes",
+    {"send", "CHAN DATA... [chunks N,M,...|random:MIN-MAX:SEED] [every N]",
+     "host transfers on CHAN (prn or scan): the data cut at the given sizes, the rest in one transfer; at sizes "
+     "drawn from MIN..MAX by a generator seeded with SEED; or in transfers of N bytes",
      2, -1, CheckSend, Send},
     {"silence", "CHAN [COUNT]", "the host stays silent for COUNT (default 1) poll periods of the reader", 1, 2,
      CheckSilence, Silence},
@@ -869,7 +953,13 @@ const std::vector<Command> kCommands = {
      "reads back on CHAN the reply to a capability request: the size reply or the XML the service answers", 2, 2,
      CheckExpectCapability, ExpectCapability},
     {"sleep", "MS", "waits MS milliseconds of real time", 1, 1, CheckNumberArgs, Sleep},
-    {"set", "timeout MS", "bound of every later wait (default 10000)", 2, 2, CheckSet, Set},
+    {"set", "timeout MS | expect continue|stop",
+     "bound of every later wait (default 10000); whether a failed expectation ends the script (stop, the default) "
+     "or is reported and counted (the exit status is still 1)",
+     2, 2, CheckSet, Set},
+    {"show", "jobs|apps|job|reader",
+     "prints the state without waiting or expecting: the jobs, the application transfers, the open job, the "
+     "print reader", 1, 1, CheckShow, Show},
     {"note", "TEXT...", "writes TEXT into the journal", 0, -1, nullptr, Note},
     {"shell-start", "", "opens a test-shell session (ESC w MAASTART) and expects its acknowledgement", 0, 0, nullptr,
      ShellStart},
@@ -887,6 +977,11 @@ const std::vector<Command> kCommands = {
      "hands the print channel to a host tool: a pseudo-terminal, LINK a symbolic link to it, opened as a printer's "
      "device node; returns when the tool has closed it",
      2, 2, CheckPty, Pty},
+    {"serve", "[prn LINK] [scan LINK]",
+     "the simulated printer for host software: each channel at LINK (default: prn at OUT/prn), a pseudo-terminal "
+     "that stays there through any number of host opens and closes; a close ends the print job it carried; runs "
+     "until SIGINT or SIGTERM",
+     0, 4, CheckServe, Serve},
     {"ui-server", "ANSWER|stop",
      "starts the operator panel's UI server on 127.0.0.1, answering every panel test with ANSWER (e.g. 9); stop "
      "ends it and journals the requests it received",

@@ -70,6 +70,15 @@ void Pattern(size_t n, uint32_t seed, std::string *out) {
     }
 }
 
+// slice:OFFSET:LENGTH:PATH (the path last: it may hold colons).
+bool ParseSlice(const std::string &item, size_t *offset, size_t *length, std::string *path) {
+    const size_t a = item.find(':', 6);
+    const size_t b = a == std::string::npos ? a : item.find(':', a + 1);
+    if (b == std::string::npos || b + 1 >= item.size()) return false;
+    *path = item.substr(b + 1);
+    return ParseSize(item.substr(6, a - 6), offset) && ParseSize(item.substr(a + 1, b - a - 1), length);
+}
+
 }  // namespace
 
 std::string SampleJob() {
@@ -107,6 +116,13 @@ bool CheckDataItem(const std::string &item, std::string *error) {
         std::string bytes;
         return ParseHex(item.substr(4), &bytes, error);
     }
+    if (StartsWith(item, "slice:")) {
+        size_t offset = 0, length = 0;
+        std::string path;
+        if (ParseSlice(item, &offset, &length, &path)) return true;
+        *error = "bad " + item + " (slice:OFFSET:LENGTH:PATH)";
+        return false;
+    }
     if (StartsWith(item, "pattern:") || StartsWith(item, "fill:")) {
         // The size here; the rest by making zero bytes of the same item.
         const size_t colon = item.find(':');
@@ -134,6 +150,20 @@ bool BuildData(const std::vector<std::string> &items, const std::string &baseDir
             *bytes += kUel;
         } else if (item == "sample") {
             *bytes += SampleJob();
+        } else if (StartsWith(item, "slice:")) {
+            size_t offset = 0, length = 0;
+            std::string path, whole;
+            if (!ParseSlice(item, &offset, &length, &path)) {
+                *error = "bad " + item + " (slice:OFFSET:LENGTH:PATH)";
+                return false;
+            }
+            if (path[0] != '/' && !baseDir.empty()) path = baseDir + "/" + path;
+            if (!ReadFile(path, &whole, error)) return false;
+            if (offset > whole.size() || length > whole.size() - offset) {
+                *error = item + ": the file has " + std::to_string(whole.size()) + " bytes";
+                return false;
+            }
+            bytes->append(whole, offset, length);
         } else if (StartsWith(item, "file:")) {
             std::string path = item.substr(5);
             if (!path.empty() && path[0] != '/' && !baseDir.empty()) path = baseDir + "/" + path;
@@ -189,6 +219,23 @@ std::vector<size_t> SplitTransfers(size_t total, const std::vector<size_t> &size
             left -= n;
         }
         if (left > 0) out.push_back(left);
+    }
+    if (out.empty()) out.push_back(0);
+    return out;
+}
+
+std::vector<size_t> RandomTransfers(size_t total, size_t min, size_t max, uint32_t seed) {
+    std::vector<size_t> out;
+    uint32_t x = seed ? seed : 0x9E3779B9u;
+    const size_t span = max - min + 1;
+    for (size_t left = total; left > 0;) {
+        x ^= x << 13;
+        x ^= x >> 17;
+        x ^= x << 5;
+        const size_t n = std::min(left, min + x % span);
+        if (n == 0) continue;  // min 0 draws an empty size now and then: skip it
+        out.push_back(n);
+        left -= n;
     }
     if (out.empty()) out.push_back(0);
     return out;

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -26,6 +27,7 @@ bool ParseSize(const std::string &text, size_t *size);
 //   sample           SampleJob()
 //   pattern:N[:SEED] N pseudo-random bytes, never ESC (0x1B)
 //   fill:N:HH        N bytes of value HH
+//   slice:OFF:LEN:PATH  LEN bytes of the file from offset OFF
 // Escapes inside double quotes are resolved by the script reader.
 bool BuildData(const std::vector<std::string> &items, const std::string &baseDir, std::string *bytes,
                std::string *error);
@@ -36,6 +38,10 @@ bool CheckDataItem(const std::string &item, std::string *error);
 // transfer; with `every` > 0, transfers of that size (the last one shorter).
 // An empty message is one zero-length transfer.
 std::vector<size_t> SplitTransfers(size_t total, const std::vector<size_t> &sizes, size_t every);
+
+// Transfer sizes for `total` bytes drawn from [min, max] by a seeded
+// generator (the last one shorter): the same cuts for the same seed.
+std::vector<size_t> RandomTransfers(size_t total, size_t min, size_t max, uint32_t seed);
 
 std::string Hex(std::string_view bytes);
 

@@ -250,4 +250,12 @@ bool FwExpectImage(Session &s, const Args &a, std::string *error) {
     return Expect(s, line, failure.empty(), failure, error);
 }
 
+std::vector<FwImageSeen> FwImages() {
+    std::vector<FwImageSeen> seen;
+    if (!ManagerRunning()) return seen;
+    for (const peers::UmImage &im : Manager().Images())
+        seen.push_back({im.type, im.received, im.complete, im.checksumOk, im.file});
+    return seen;
+}
+
 }  // namespace sim

@@ -3,7 +3,9 @@
 // print channel, and what the manager received.
 #pragma once
 
+#include <cstdint>
 #include <string>
+#include <vector>
 
 #include "Script.h"
 
@@ -17,5 +19,14 @@ bool CheckFwExpectImages(const Args &a, std::string *error);
 bool FwExpectImages(Session &s, const Args &a, std::string *error);
 bool CheckFwExpectImage(const Args &a, std::string *error);
 bool FwExpectImage(Session &s, const Args &a, std::string *error);
+
+// The images the update manager has received so far (none without fw-manager).
+struct FwImageSeen {
+    uint32_t type = 0;
+    uint64_t bytes = 0;
+    bool complete = false, checksumOk = false;
+    std::string file;
+};
+std::vector<FwImageSeen> FwImages();
 
 }  // namespace sim

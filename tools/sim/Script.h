@@ -44,7 +44,9 @@ bool ParseScriptLine(const std::string &text, const std::string &where, const st
                      std::vector<ScriptLine> *lines, std::string *error);
 
 // Runs the lines in order and stops at the first failure, which is reported
-// on stderr and in the journal. True when every command passed.
+// on stderr and in the journal; after "set expect continue" a failed
+// expectation is reported and the script goes on. True when every command
+// passed.
 bool RunScript(Session &session, const std::vector<ScriptLine> &lines);
 
 // The commands and data items, for --help.

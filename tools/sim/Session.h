@@ -38,6 +38,8 @@ struct Session {
     std::string outDir;               // the reference service's output directory
     std::string baseDir;              // relative file: paths start here
     int timeoutMs = 10000;            // bound of every wait
+    bool expectContinue = false;      // a failed expect-* is counted, not the end
+    int expectFailures = 0;
     Journal journal;
     FileTail javaJournal;
 

@@ -43,6 +43,7 @@ constexpr int kScanQueueProject = 6;
 
 const char kUsage[] =
     "usage: usbadapter-sim [options] [FILE.prn ...]\n"
+    "       usbadapter-sim serve [options]\n"
     "\n"
     "Starts a JVM with the reference print service and libusbadapter on virtual\n"
     "devices, plays the service's start-up (creatPrnScanMsgQs, initDevice,\n"
@@ -51,6 +52,13 @@ const char kUsage[] =
     "silent until the job has ended; -s and -e run script commands instead. With\n"
     "neither, the built-in sample job (PJL in UEL framing) is sent. Sources run in\n"
     "the order given.\n"
+    "\n"
+    "serve: a simulated printer for host software until SIGINT or SIGTERM. The\n"
+    "print channel is the pseudo-terminal at OUT/prn (--prn), the scan channel the\n"
+    "one at OUT/scan (--scan); both stay there through any number of host opens and\n"
+    "closes. A close ends the print job it carried. It runs fw-manager and\n"
+    "scan-start first (after -s and -e, if given) and prints a line per host\n"
+    "session, job, application transfer and firmware image as it ends.\n"
     "\n"
     "  -s, --script FILE      run the commands in FILE ('-': standard input)\n"
     "  -e, --exec LINE        run one command line\n"
@@ -61,6 +69,8 @@ const char kUsage[] =
     "      --root DIR         root of the controller's fixed paths (default:\n"
     "                         $USBADAPTER_ROOT, else a temporary directory)\n"
     "      --no-plug          leave the device unconfigured after start-up\n"
+    "      --prn LINK         serve: path of the print channel (default OUT/prn)\n"
+    "      --scan LINK        serve: path of the scan channel (default OUT/scan)\n"
     "      --timeout MS       bound of every wait (default 10000)\n"
     "      --model NAME       model name (default \"Tarnwel MFP\")\n"
     "      --manufacturer S   manufacturer string (default \"Tarnwel\")\n"
@@ -86,6 +96,8 @@ struct Options {
     std::string journal, root;
     bool plug = true;
     bool verbose = false;
+    bool serve = false;
+    std::string prnLink, scanLink;
     int timeoutMs = 10000;
     std::string model = "Tarnwel MFP", manufacturer = "Tarnwel", deviceClass = "PRINTER";
     int fax = 1;
@@ -116,7 +128,7 @@ bool AddLine(Options &o, const std::string &text, const std::string &where, std:
 int ParseOptions(int argc, char **argv, Options &o) {
     enum {
         kJournal = 256, kRoot, kNoPlug, kTimeout, kModel, kManufacturer, kDeviceClass, kFax, kXmx, kNoCheckJni,
-        kJar, kLibDir, kJvmOption,
+        kJar, kLibDir, kJvmOption, kPrn, kScan,
     };
     static const option longs[] = {
         {"script", required_argument, nullptr, 's'},   {"exec", required_argument, nullptr, 'e'},
@@ -128,6 +140,7 @@ int ParseOptions(int argc, char **argv, Options &o) {
         {"xmx", required_argument, nullptr, kXmx},     {"no-check-jni", no_argument, nullptr, kNoCheckJni},
         {"jar", required_argument, nullptr, kJar},     {"libdir", required_argument, nullptr, kLibDir},
         {"jvm-option", required_argument, nullptr, kJvmOption}, {"verbose", no_argument, nullptr, 'v'},
+        {"prn", required_argument, nullptr, kPrn},     {"scan", required_argument, nullptr, kScan},
         {"help", no_argument, nullptr, 'h'},           {nullptr, 0, nullptr, 0},
     };
     int execCount = 0;
@@ -178,12 +191,28 @@ int ParseOptions(int argc, char **argv, Options &o) {
         case kJar: o.jvm.classPath = Absolute(optarg); break;
         case kLibDir: o.jvm.libDir = Absolute(optarg); break;
         case kJvmOption: o.jvm.extra.push_back(optarg); break;
+        case kPrn: o.prnLink = Absolute(optarg); break;
+        case kScan: o.scanLink = Absolute(optarg); break;
         case 'v': o.verbose = true; break;
         case 'h': std::fputs(kUsage, stdout); std::fputs(("\n" + sim::ScriptHelp()).c_str(), stdout); return -1;
         default: return Usage("unknown option");
         }
     }
     if (o.timeoutMs <= 0) return Usage("--timeout needs a positive number of milliseconds");
+    if (o.serve) {
+        if (o.prnLink.empty()) o.prnLink = Absolute(o.outDir + "/prn");
+        if (o.scanLink.empty()) o.scanLink = Absolute(o.outDir + "/scan");
+        const std::vector<std::string> words = {"serve", "prn", o.prnLink, "scan", o.scanLink};
+        AddLine(o, "fw-manager", "serve", &error);
+        AddLine(o, "scan-start", "serve", &error);
+        o.lines.push_back({"serve", "serve", "", sim::FindCommand("serve"), {words.begin() + 1, words.end()}});
+    }
+    // SIGINT and SIGTERM end a serve command, not the JVM.
+    for (const sim::ScriptLine &line : o.lines) {
+        if (line.command != sim::FindCommand("serve")) continue;
+        o.jvm.extra.push_back("-Xrs");
+        break;
+    }
     if (o.lines.empty() && o.files.empty()) {
         AddLine(o, "send prn sample", "sample", &error);
         AddLine(o, "end-job", "sample", &error);
@@ -380,6 +409,12 @@ void StartService(const Options &o) {
 
 int main(int argc, char **argv) {
     Options o;
+    if (argc > 1 && std::string(argv[1]) == "serve") {
+        o.serve = true;
+        argv[1] = argv[0];
+        --argc;
+        ++argv;
+    }
     if (int rc = ParseOptions(argc, argv, o); rc != 0) return rc < 0 ? kExitPassed : rc;
 
     sim::Session &s = gSession;
