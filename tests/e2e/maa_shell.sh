@@ -12,6 +12,15 @@ fail() {
     echo "(files kept in $dir)"
     exit 1
 }
+# Waits (bounded) for the simulator's pseudo-terminal link; $1 names the step.
+await_pty() {
+    i=0
+    while [ ! -L "$dir/prn" ]; do
+        i=$((i + 1))
+        [ $i -lt 400 ] || fail "the simulator made no pseudo-terminal${1:+ ($1)}"
+        sleep 0.05
+    done
+}
 
 # The sample session: a path downloaded with its last letter wrong, corrected
 # by an assignment through a pointer into the download buffer, then dumped; the
@@ -27,12 +36,7 @@ grep -q '"event":"shell-put","bytes":38,' "$dir/out/session.jsonl" || fail "no d
 # The host tool on the simulator's print channel: plain open/read/write.
 "$sim" --out "$dir/out2" --timeout 8000 -e "pty prn $dir/prn" -e "expect-jobs 0" >"$dir/sim2.txt" 2>&1 &
 pid=$!
-i=0
-while [ ! -L "$dir/prn" ]; do
-    i=$((i + 1))
-    [ $i -lt 400 ] || fail "the simulator made no pseudo-terminal"
-    sleep 0.05
-done
+await_pty
 "$tool" -w 300 -e 'Dump_File("/halvard/sys/statusinfo/usb_speed.txt")' -e 'Dump_File("/nothing")' "$dir/prn" \
     >"$dir/tool.txt" 2>&1
 status=$?
@@ -54,12 +58,7 @@ printf '%s\n' 'Dump_File("/halvard/sys/statusinfo/usb_speed.txt")' '' ' ' \
 USBADAPTER_LOG_LEVEL=INFO "$sim" --out "$dir/out3" --timeout 8000 -e "pty prn $dir/prn" -e "expect-jobs 0" \
     >"$dir/sim3.txt" 2>&1 &
 pid=$!
-i=0
-while [ ! -L "$dir/prn" ]; do
-    i=$((i + 1))
-    [ $i -lt 400 ] || fail "the simulator made no pseudo-terminal (auto session)"
-    sleep 0.05
-done
+await_pty "auto session"
 "$tool" --auto -s "$dir/auto.txt" "$dir/prn" >"$dir/auto-out.txt" 2>"$dir/auto-err.txt"
 status=$?
 wait $pid
@@ -89,12 +88,7 @@ grep -q '^echo start > .*/proc/cpufantest$' "$dir/out4/commands.log" || fail "th
 # The host tool lists the vocabulary on the simulator's print channel.
 "$sim" --out "$dir/out5" --timeout 8000 -e "pty prn $dir/prn" -e "expect-jobs 0" >"$dir/sim5.txt" 2>&1 &
 pid=$!
-i=0
-while [ ! -L "$dir/prn" ]; do
-    i=$((i + 1))
-    [ $i -lt 400 ] || fail "the simulator made no pseudo-terminal (symbol dump)"
-    sleep 0.05
-done
+await_pty "symbol dump"
 "$tool" -w 300 -e 'MAA_SymbolDump()' "$dir/prn" >"$dir/tool5.txt" 2>&1
 status=$?
 wait $pid
