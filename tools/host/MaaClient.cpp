@@ -3,6 +3,7 @@
 #include <poll.h>
 #include <unistd.h>
 
+#include <cctype>
 #include <cerrno>
 #include <chrono>
 #include <cstdint>
@@ -207,6 +208,30 @@ bool Session::Stop() {
     if (!ReadExact(&ack, kAck.size(), timeoutMs_) || ack != kAck)
         return Fail("unexpected answer to the stop command: " + Hex(ack));
     return true;
+}
+
+bool CallsFunction(const std::string &line) {
+    enum { None, Name, Number } token = None;  // the word just before, blanks skipped
+    for (size_t i = 0; i < line.size(); ++i) {
+        const unsigned char c = static_cast<unsigned char>(line[i]);
+        if (c == '"') {
+            for (++i; i < line.size() && line[i] != '"'; ++i) {
+                if (line[i] == '\\') ++i;
+            }
+            token = None;
+        } else if (c == '#') {
+            return false;  // the rest of the line is raw bytes
+        } else if (std::isalnum(c) || c == '_') {
+            if (token == None) token = std::isdigit(c) ? Number : Name;
+        } else if (c == '(' && token == Name) {
+            return true;
+        } else if (c == ' ' || c == '\t') {
+            if (token == Number) token = None;  // a name may still be followed by "("
+        } else {
+            token = None;
+        }
+    }
+    return false;
 }
 
 int Session::Collect(const std::function<void(const Frame &)> &onFrame, int quietMs, int lingerMs) {

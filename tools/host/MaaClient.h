@@ -58,6 +58,10 @@ struct Frame {
 // Empty when a download of `size` bytes can be sent, else why not: its size
 // travels in a 32-bit field.
 std::string CheckDownloadSize(uint64_t size);
+// True when the line calls a function (a name followed by "(" outside string
+// literals): only such a line may take long before its records come, so only
+// it gets the long silence wait.
+bool CallsFunction(const std::string &line);
 
 // The device runs an auto session's saved lines up to the first empty one, so
 // blank lines (empty or only blanks and tabs) are removed from an auto script;

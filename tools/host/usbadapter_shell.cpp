@@ -7,6 +7,7 @@
 #include <getopt.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
@@ -38,7 +39,10 @@ const char kUsage[] =
     "                      at an empty line, so blank lines are dropped (a note\n"
     "                      on standard error says how many)\n"
     "  -o, --save DIR      directory for files the device sends (default .)\n"
-    "  -w, --wait MS       silence that ends the output of a line (default 2000)\n"
+    "  -w, --wait MS       silence that ends the output of a line that calls a\n"
+    "                      function (default 2000)\n"
+    "      --short-wait MS silence that ends the output of any other line\n"
+    "                      (assignments, expressions; default 200)\n"
     "  -t, --timeout MS    bound of every answer the device owes (default 5000)\n"
     "      --raw           also print each frame in hex\n"
     "      --no-stop       leave the session open at the end\n"
@@ -59,6 +63,7 @@ struct Options {
     bool autoMode = false;
     std::string saveDir = ".";
     int waitMs = 2000;
+    int shortWaitMs = 200;
     int timeoutMs = 5000;
     bool raw = false;
     bool stop = true;
@@ -115,7 +120,9 @@ public:
         const std::string line = Substitute(typed, addr_);
         if (line.rfind("!put ", 0) == 0) return Put(line.substr(5));
         if (line.size() > 1024) std::cerr << "warning: the device cuts lines at 1024 characters\n";
-        int n = s_.Command(line, [this](const maahost::Frame &f) { Print(f); }, o_.waitMs);
+        // Only a function can take long to answer; other lines answer at once or never.
+        const int wait = maahost::CallsFunction(line) ? o_.waitMs : std::min(o_.shortWaitMs, o_.waitMs);
+        int n = s_.Command(line, [this](const maahost::Frame &f) { Print(f); }, wait);
         if (n < 0) std::cerr << "usbadapter-shell: " << s_.Error() << "\n";
         return n >= 0;
     }
@@ -176,13 +183,14 @@ private:
 
 int main(int argc, char **argv) {
     Options o;
-    enum { kAuto = 256, kRaw, kNoStop };
+    enum { kAuto = 256, kRaw, kNoStop, kShortWait };
     const option longOptions[] = {
         {"exec", required_argument, nullptr, 'e'},  {"script", required_argument, nullptr, 's'},
         {"put", required_argument, nullptr, 'p'},   {"auto", no_argument, nullptr, kAuto},
         {"save", required_argument, nullptr, 'o'},  {"wait", required_argument, nullptr, 'w'},
         {"timeout", required_argument, nullptr, 't'}, {"raw", no_argument, nullptr, kRaw},
         {"no-stop", no_argument, nullptr, kNoStop}, {"help", no_argument, nullptr, 'h'},
+        {"short-wait", required_argument, nullptr, kShortWait},
         {nullptr, 0, nullptr, 0},
     };
     bool anySource = false;
@@ -204,6 +212,7 @@ int main(int argc, char **argv) {
         case kAuto: o.autoMode = true; break;
         case 'o': o.saveDir = optarg; break;
         case 'w': o.waitMs = std::atoi(optarg); break;
+        case kShortWait: o.shortWaitMs = std::atoi(optarg); break;
         case 't': o.timeoutMs = std::atoi(optarg); break;
         case kRaw: o.raw = true; break;
         case kNoStop: o.stop = false; break;
@@ -212,7 +221,8 @@ int main(int argc, char **argv) {
         }
     }
     if (optind + 1 != argc) return Usage("one DEVICE expected");
-    if (o.waitMs <= 0 || o.timeoutMs <= 0) return Usage("--wait and --timeout take a positive number of milliseconds");
+    if (o.waitMs <= 0 || o.shortWaitMs <= 0 || o.timeoutMs <= 0)
+        return Usage("--wait, --short-wait and --timeout take a positive number of milliseconds");
     o.device = argv[optind];
     o.fromStdin = !anySource;
     if (o.fromStdin && o.autoMode) ReadLines(std::cin, &o.lines);

@@ -56,5 +56,23 @@ TEST(DropBlankLines, KeepsEveryLineTheAutoRunShouldReach) {
     }
 }
 
+TEST(CallsFunction, OnlyANameFollowedByAParenthesisOutsideTextsGetsTheLongWait) {
+    struct Row {
+        const char *line;
+        bool calls;
+    } rows[] = {
+        {"MAA_SymbolDump()", true},
+        {"x = Delay_ms (5)", true},
+        {"*(char*)(0x01000000 + 36) = 0x74", false},  // casts and grouping
+        {"a = (b + 1) * 2", false},
+        {"x = 0x12(3)", false},                        // a number is no name
+        {"s = \"f(1)\"", false},                      // inside a text
+        {"s = \"a\\\"b(\" ; g(1)", true},            // an escaped quote does not end the text
+        {"#$%\x01", false},
+        {"", false},
+    };
+    for (const Row &r : rows) EXPECT_EQ(CallsFunction(r.line), r.calls) << r.line;
+}
+
 }  // namespace
 }  // namespace maahost
