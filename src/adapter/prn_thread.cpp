@@ -51,6 +51,7 @@ U8 aubcommand[COMMAND_SIZE];
 U8 aubsplitUelSendBuffer[COMMAND_SIZE];
 
 bool shouldPark() { return !IsConfigured.load() || hibernation_flag.load() != 0; }
+bool mayRead() { return !shouldPark(); }
 
 // poll for input on the print node. A signal (the bridge's notifications come
 // as SIGIO) does not end the wait unless the reader is to park.
@@ -467,7 +468,9 @@ void StartReading(void) {
         // The open job is ended: a close waiting for the reader need not
         // wait for the pause as well.
         if (hibernation_flag.load() == 1) IsCanClose = 1;
-        ::sleep(1);
+        // A second between looks at the flags, cut short once reading may go
+        // on: a host that configures the device again is served at once.
+        Wait_IdleRest(Wait_NowMs(), 1000, mayRead);
     }
 }
 

@@ -324,6 +324,11 @@ TEST_F(Simulator, PulledCableEndsTheOpenJobAndAReplugReadsAgain) {
     EXPECT_GT(IndexOf("java", "job-end"), IndexOf("host", "unplug"));
     EXPECT_EQ(ReadFile(Out("job-001.prn")), partial);
     EXPECT_EQ(ReadFile(Out("job-002.prn")), next);
+    // The parked reader looks at the flags once a second but goes on as soon as
+    // the host configures the device again: the next job does not wait for that.
+    const long plugged = std::stol(Events("host", "plug").back()["ms"]);
+    const long started = std::stol(Events("java", "job-start").back()["ms"]);
+    EXPECT_LT(started - plugged, 600);
 }
 
 TEST_F(Simulator, DataSentBeforeTheHostConfiguresTheDeviceIsReadAfterwards) {
