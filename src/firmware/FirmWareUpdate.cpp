@@ -226,10 +226,10 @@ S32 FirmWareDownload(S32 fdPrn, U8 *command, U32 commandlen, U8 *firmware_comman
     // caller's buffer can take back.
     S32 held = static_cast<S32>(commandlen + static_cast<U32>(n));
     U32 running = 0;
-    // The description leaves each connection open. We close an image's
-    // connection once the next image's is up and the last one when the call
-    // returns: the manager has answered by then, and a process that outlives a
-    // failed download would otherwise lose descriptors with every firmware file.
+    // An image's connection is closed once the next image's is up, the last
+    // one when the call returns: the manager has answered by then, and a
+    // process that outlives a failed download must not lose descriptors with
+    // every firmware file.
     UniqueFd conn;
     for (;;) {
         if (std::memcmp(header, kFirmwareHeaderText, PARTIAL_HEADER_SIZE) != 0) {
