@@ -17,6 +17,7 @@
 #include <string>
 #include <thread>
 
+#include "FwPack.h"
 #include "RatioReporter.h"
 #include "UpdateManagerSim.h"
 #include "common/ByteOrder.h"
@@ -35,11 +36,7 @@ std::string Image(size_t n) {
     return s;
 }
 
-std::string Header(uint32_t size) {
-    std::string h = "\x1b%-12345X@PJL\r\n@PJL FIRMWARE = E7  " + std::string(39, ' ') + std::string(6, '\0');
-    WriteBE32(reinterpret_cast<uint8_t *>(h.data()) + 74, size);
-    return h;
-}
+std::string Header(uint32_t size) { return fwpack::Header("E7", size); }
 
 // Standard output is where the library marks each block sent.
 class MutedStdout {

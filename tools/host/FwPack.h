@@ -7,6 +7,8 @@
 #include <cstdint>
 #include <string>
 
+#include "common/ByteOrder.h"
+
 namespace fwpack {
 
 inline constexpr size_t kHeaderSize = 80;
@@ -16,9 +18,8 @@ inline constexpr char kHeaderText[] = "\x1b%-12345X@PJL\r\n@PJL FIRMWARE = ";  /
 inline std::string Header(const std::string &id, uint32_t bodySize) {
     std::string h(kHeaderText, sizeof kHeaderText - 1);
     h += (id + "    ").substr(0, 4);
-    h += std::string(74 - h.size(), ' ');
-    for (int shift = 24; shift >= 0; shift -= 8) h += static_cast<char>((bodySize >> shift) & 0xFF);
-    h += "\r\n";
+    h += std::string(74 - h.size(), ' ') + std::string(4, '\0') + "\r\n";
+    WriteBE32(reinterpret_cast<uint8_t *>(h.data()) + 74, bodySize);
     return h;
 }
 

@@ -12,6 +12,8 @@
 #include <cstring>
 #include <memory>
 
+#include "common/ByteOrder.h"
+
 namespace peers {
 namespace {
 
@@ -31,12 +33,6 @@ const Name kNames[] = {
     {UmMisbehaviour::SlowProgress, "slow-progress"},
 };
 
-uint32_t be32(const uint8_t *p) {
-    return (uint32_t{p[0]} << 24) | (uint32_t{p[1]} << 16) | (uint32_t{p[2]} << 8) | p[3];
-}
-void putBe32(uint8_t *p, uint32_t v) {
-    for (int i = 0; i < 4; ++i) p[i] = static_cast<uint8_t>(v >> (24 - 8 * i));
-}
 
 // 16-bit big-endian words of a byte stream fed in pieces; an odd last byte is
 // the high byte of a word.
@@ -240,8 +236,8 @@ bool UpdateManagerSim::serveImage(int fd) {
         return false;
     }
     UmImage img;
-    img.type = be32(words);
-    img.size = be32(words + 4);
+    img.type = ReadBE32(words);
+    img.size = ReadBE32(words + 4);
     size_t index;
     {
         std::lock_guard<std::mutex> lock(mu_);
@@ -259,8 +255,8 @@ bool UpdateManagerSim::serveImage(int fd) {
     // What the library's image header adds: "$IMG", size, type.
     WordSum sum;
     uint8_t header[12] = {'$', 'I', 'M', 'G'};
-    putBe32(header + 4, img.size);
-    putBe32(header + 8, img.type);
+    WriteBE32(header + 4, img.size);
+    WriteBE32(header + 8, img.type);
     sum.add(header, sizeof header);
     WordSum body;
     std::vector<uint8_t> buf(1 << 16);
@@ -322,7 +318,7 @@ bool UpdateManagerSim::serveImage(int fd) {
         return false;
     }
     uint8_t verdict[4];
-    putBe32(verdict, ok && m != UmMisbehaviour::ChecksumError ? 1 : 2);
+    WriteBE32(verdict, ok && m != UmMisbehaviour::ChecksumError ? 1 : 2);
     return writeAll(fd, verdict, sizeof verdict);
 }
 

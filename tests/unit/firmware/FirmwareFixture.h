@@ -31,18 +31,15 @@
 #include "common/ByteOrder.h"
 #include "firmware/FirmWareUpdate.h"
 #include "firmware/UpdateManager.h"
+#include "FwPack.h"
 #include "vdev.h"
 
 namespace fwtest {
 
-inline const std::string kHeaderText = "\x1b%-12345X@PJL\r\n@PJL FIRMWARE = ";
+inline const std::string kHeaderText = fwpack::kHeaderText;
 
 // The 80-byte header a host puts in front of an image.
-inline std::string Header(const std::string &id, uint32_t size) {
-    std::string h = kHeaderText + (id + "    ").substr(0, 4) + std::string(39, ' ') + std::string(4, '\0') + "\r\n";
-    WriteBE32(reinterpret_cast<uint8_t *>(h.data()) + 74, size);
-    return h;
-}
+inline std::string Header(const std::string &id, uint32_t size) { return fwpack::Header(id, size); }
 
 inline std::string Body(size_t n, unsigned seed) {
     std::mt19937 gen(seed);
