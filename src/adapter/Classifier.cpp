@@ -331,41 +331,39 @@ S32 USBAdpater_StartDataClassifier(U8 *pubCommand, U8 *pubfirmware_command, S32 
 
 S32 CheckUELCommand(U8 *buffer, S32 size) {
     USBADP_LOG(DEBUG, "[USBAdp]Inside CheckUELCommand:::: size is [%d]\n", size);
-    S32 i = 0;
-    while (i < size) {
-        if (buffer[i] != ESC) {
-            const void *next = std::memchr(buffer + i, ESC, static_cast<size_t>(size - i));
-            if (!next) {
-                i = size;
-                break;
-            }
-            i = static_cast<S32>(static_cast<const U8 *>(next) - buffer);
-        }
-        UelPosition = i;
-        bool whole = true;
-        for (S32 j = 1; j < UEL_PATTERN_SIZE; ++j) {
-            if (i == size - 1) {
-                // The buffer ends inside the pattern: j of its bytes are here.
-                splitPatternMarker = j;
-                splitPatternFlag = 1;
-                USBADP_LOG(DEBUG, "[USBAdp]splitPatternMarker : [%d]\n", splitPatternMarker);
-                USBADP_LOG(DEBUG, "[USBAdp]returning false\n");
-                return 0;
-            }
-            ++i;
-            if (buffer[i] != UELPattern[j]) {
-                whole = false;
-                break;
-            }
-        }
-        if (whole) {
+    if (size <= 0) {
+        USBADP_LOG(DEBUG, "[USBAdp]return FALSE :: Exiting with i [%d]\n", 0);
+        return 0;
+    }
+    // memchr finds each ESC; only an ESC is looked at further. A mismatch ends
+    // at a pattern byte, none of which is an ESC, so the search goes on right
+    // behind the ESC.
+    const U8 *const end = buffer + size;
+    const U8 *esc = nullptr;
+    for (const U8 *p = buffer; (p = static_cast<const U8 *>(std::memchr(p, ESC, static_cast<size_t>(end - p))));
+         ++p) {
+        esc = p;
+        const size_t avail = static_cast<size_t>(end - p);
+        if (avail >= UEL_PATTERN_SIZE) {
+            if (p[1] != UELPattern[1] || std::memcmp(p + 2, UELPattern + 2, UEL_PATTERN_SIZE - 2) != 0) continue;
+            UelPosition = static_cast<S32>(p - buffer);
             ++jobCounter;
             USBADP_LOG(DEBUG, "[USBAdp]return TRUE HITT jobCounter[%d]\n", jobCounter);
             USBADP_LOG(DEBUG, "[USBAdp]return TRUE HITT UelPosition[%d]\n", UelPosition);
             return 1;
         }
-        // The mismatching byte is looked at again: it may start a UEL itself.
+        size_t j = 1;
+        while (j < avail && p[j] == UELPattern[j]) ++j;
+        if (j < avail) continue;
+        // The buffer ends inside the pattern: avail of its bytes are here.
+        UelPosition = static_cast<S32>(p - buffer);
+        splitPatternMarker = static_cast<S32>(avail);
+        splitPatternFlag = 1;
+        USBADP_LOG(DEBUG, "[USBAdp]splitPatternMarker : [%d]\n", splitPatternMarker);
+        USBADP_LOG(DEBUG, "[USBAdp]returning false\n");
+        return 0;
     }
-    USBADP_LOG(DEBUG, "[USBAdp]return FALSE :: Exiting with i [%d]\n", i);
+    if (esc) UelPosition = static_cast<S32>(esc - buffer);
+    USBADP_LOG(DEBUG, "[USBAdp]return FALSE :: Exiting with i [%d]\n", size);
     return 0;
 }

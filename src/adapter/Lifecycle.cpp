@@ -51,6 +51,7 @@ S32 USBAdapter_IF_PrintClose(void) {
     // before the reader has parked again.
     if (startreading_enter.load() == 1) IsCanClose = 0;
     hibernation_flag = 1;
+    USBAdapter_WakeReader();
     while (startreading_enter.load() == 1 && IsCanClose.load() != 1) ::usleep(1);
     // 0 is "not open": closing it would close standard input.
     const int fd = fdPrn.exchange(0);

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <sys/eventfd.h>
 #include <sys/ioctl.h>
 #include <sys/msg.h>
 #include <unistd.h>
@@ -40,11 +41,14 @@ namespace {
 
 constexpr char kManufacturer[] = "Tarnwel Electronics Co., Ltd.";
 
+// A read lands behind at most FRM_DETECT_BUFFER_SIZE classifier bytes.
+static_assert(TEMP_SEND_BUFFER_SIZE >= FRM_DETECT_BUFFER_SIZE + RX_BUFFER_SIZE);
+
 // Allocated once when reading starts and kept for the life of the process.
-U8 *received_data;       // one read of host data
+U8 *received_data;       // allocated with the others; reads go into tempSendBuffer
 U8 *vlx_command;         // kept for the layout of the reader; not used
 U8 *firmware_command;    // bytes the classifier took off the node (at most 80)
-U8 *tempSendBuffer;      // firmware_command bytes + the read: the current chunk
+U8 *tempSendBuffer;      // firmware_command bytes, then the read: the current chunk
 U8 *temp2UelSendBuffer;  // held UEL bytes + the current chunk
 U8 *tempUelSendBuffer;   // cursor into the chunk being delivered
 U8 aubcommand[COMMAND_SIZE];
@@ -53,9 +57,19 @@ U8 aubsplitUelSendBuffer[COMMAND_SIZE];
 bool shouldPark() { return !IsConfigured.load() || hibernation_flag.load() != 0; }
 bool mayRead() { return !shouldPark(); }
 
+// Written when the reader is asked to park from another thread (the close):
+// its wait on the node ends at once, not after up to POLL_TIMEOUT_UEL. -1 when
+// it cannot be had: the wait then ends at the next signal or time-out.
+int parkWakeFd() {
+    static const int fd = ::eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC);
+    return fd;
+}
+
 // poll for input on the print node. A signal (the bridge's notifications come
 // as SIGIO) does not end the wait unless the reader is to park.
-int pollPrn(int timeoutMs, short *revents) { return Wait_PollIn(fdPrn.load(), timeoutMs, revents, shouldPark); }
+int pollPrn(int timeoutMs, short *revents) {
+    return Wait_PollIn(fdPrn.load(), timeoutMs, revents, shouldPark, parkWakeFd());
+}
 
 // The node said it was ready and gave nothing (hung up, closed, failed): the
 // poll period is over only when its time is, or the reader would spin.
@@ -403,7 +417,9 @@ void USBAdapter_ReadPass(void) {
         USBADP_LOG(DEBUG, "[USBAdp] slRet from poll: %d\n", slRet);
         if (revents) USBADP_LOG(DEBUG, "[USBAdp]n revents in fd[0]: %d\n", revents);
         if (slRet > 0) {
-            ssize_t n = Wait_Read(fdPrn.load(), received_data, RX_BUFFER_SIZE, shouldPark);
+            // Straight behind the classifier's bytes: the chunk is whole without
+            // a copy. tempSendBuffer holds FRM_DETECT_BUFFER_SIZE + RX_BUFFER_SIZE.
+            ssize_t n = Wait_Read(fdPrn.load(), tempSendBuffer + firmRes, RX_BUFFER_SIZE, shouldPark);
             if (n > 0) {
                 prn_read_ret = static_cast<S32>(n);
                 USBADP_LOG(DEBUG, "[USBAdp]Got the data with size[%d]\n", prn_read_ret);
@@ -427,7 +443,6 @@ void USBAdapter_ReadPass(void) {
 
     std::memcpy(tempSendBuffer, firmware_command, static_cast<size_t>(firmRes));
     if (prn_read_ret > 0) {
-        std::memcpy(tempSendBuffer + firmRes, received_data, static_cast<size_t>(prn_read_ret));
         USBADP_LOG(DEBUG, "[USBAdp] Normal memcpy\n");
     } else {
         USBADP_LOG(DEBUG, "[USBAdp] data less than 80 bytes\n");
@@ -438,6 +453,14 @@ void USBAdapter_ReadPass(void) {
     restData = prn_read_ret + firmRes;
     dataEnd = 0;
     frameChunk(d);
+}
+
+void USBAdapter_WakeReader(void) {
+    if (int fd = parkWakeFd(); fd >= 0) {
+        uint64_t one = 1;
+        ssize_t n = ::write(fd, &one, sizeof one);
+        (void)n;
+    }
 }
 
 void USBAdapter_EndJobOnPark(void) {
@@ -452,6 +475,8 @@ void USBAdapter_EndJobOnPark(void) {
     passHeldBytes(d);
     d.NotifyEndOfData();
     InitializeVars();
+    // The UEL job's long wait ended with it; the next one starts idle.
+    slPollTimeout = POLL_TIMEOUT_IDLE;
 }
 
 void StartReading(void) {

@@ -41,6 +41,9 @@ void InitializeVars(void);
 // buffers (once; 1 when they are there) and one turn of the inner loop.
 S32 USBAdapter_AllocateReadBuffers(void);
 void USBAdapter_ReadPass(void);
+// Ends the reader's wait on the node at once after hibernation_flag (or
+// another reason to park) was set from another thread.
+void USBAdapter_WakeReader(void);
 // What the loop does when it parks (cable pulled, channel closing): an open
 // job ends with whatever it holds.
 void USBAdapter_EndJobOnPark(void);

@@ -27,15 +27,29 @@ int64_t Wait_NowMs() {
     return static_cast<int64_t>(ts.tv_sec) * 1000 + ts.tv_nsec / 1000000;
 }
 
-int Wait_PollIn(int fd, int timeoutMs, short *revents, WaitGoneFn gone) {
+int Wait_PollIn(int fd, int timeoutMs, short *revents, WaitGoneFn gone, int wakeFd) {
     const int64_t deadline = timeoutMs < 0 ? -1 : Wait_NowMs() + timeoutMs;
     int wait = timeoutMs;
     for (;;) {
-        pollfd pfd{fd, POLLIN, 0};
-        int r = ::poll(&pfd, 1, wait);
-        if (revents) *revents = pfd.revents;
-        if (r >= 0 || errno != EINTR) return r;
-        if (gone && gone()) return -1;
+        pollfd pfd[2] = {{fd, POLLIN, 0}, {wakeFd, POLLIN, 0}};
+        int r = ::poll(pfd, wakeFd >= 0 ? 2 : 1, wait);
+        if (revents) *revents = pfd[0].revents;
+        if (r > 0 && pfd[0].revents) return 1;
+        if (r > 0 && (pfd[1].revents & POLLIN)) {
+            // Only the wake-up: drained before gone() is asked, so one that
+            // comes after the answer is not lost.
+            uint64_t count;
+            ssize_t n = ::read(wakeFd, &count, sizeof count);
+            (void)n;
+        } else if (r > 0) {
+            wakeFd = -1;  // a wake-up descriptor that failed is not watched again
+        } else if (r == 0 || errno != EINTR) {
+            return r;
+        }
+        if (gone && gone()) {
+            errno = EINTR;
+            return -1;
+        }
         wait = remaining(deadline);
     }
 }

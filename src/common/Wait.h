@@ -21,8 +21,10 @@ int64_t Wait_NowMs();
 
 // poll(2) for input on one descriptor within timeoutMs (< 0: no limit).
 // > 0 ready (revents set), 0 time-out, -1 error with errno; -1 with EINTR only
-// when gone() asked to stop.
-int Wait_PollIn(int fd, int timeoutMs, short *revents, WaitGoneFn gone = nullptr);
+// when gone() asked to stop. wakeFd (an eventfd, non-blocking; < 0: none) is
+// watched as well: whoever changes what gone() answers writes to it, so the
+// wait ends at once and not at the next signal. Each wake-up is drained.
+int Wait_PollIn(int fd, int timeoutMs, short *revents, WaitGoneFn gone = nullptr, int wakeFd = -1);
 
 // read(2) that resumes after a signal; -1 with EINTR only when gone() asked to
 // stop.

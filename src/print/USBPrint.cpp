@@ -30,6 +30,11 @@ struct PrintEntryClaim {
     ~PrintEntryClaim() { printEntryBusy.store(false); }
 };
 
+// PassData's method and the handler class it belongs to (a global reference,
+// so the class and the id stay valid), per thread: no lock on the data path.
+thread_local jobject passDataClass = nullptr;
+thread_local jmethodID passDataMethod = nullptr;
+
 const TPrintDelivery kUpcalls = {RegisterJob, PassData, NotifyEndOfData, SendAppType, SendAppBuf, NotifyAppEnd};
 std::atomic<const TPrintDelivery *> delivery{&kUpcalls};
 
@@ -119,11 +124,20 @@ void PassData(U8 *received_data, S32 prn_read_ret) {
         JNI_ExceptionSweep(env);
         return;
     }
-    jmethodID mid = env->GetMethodID(cls.get(), "addBufferToList", "(Ljava/nio/ByteBuffer;)V");
-    if (!mid) {
-        USBADP_LOG(ERROR, "[USBAdp] Error in PassData()::can't find addBufferToList().\n");
-        JNI_ExceptionSweep(env);
-        return;
+    // The method is looked up once per handler class, not once per chunk; a
+    // class without it is looked up (and logged) on every call, as before.
+    jmethodID mid = nullptr;
+    if (passDataClass && env->IsSameObject(cls.get(), passDataClass)) {
+        mid = passDataMethod;
+    } else {
+        mid = env->GetMethodID(cls.get(), "addBufferToList", "(Ljava/nio/ByteBuffer;)V");
+        if (!mid) {
+            USBADP_LOG(ERROR, "[USBAdp] Error in PassData()::can't find addBufferToList().\n");
+            JNI_ExceptionSweep(env);
+            return;
+        }
+        JNI_ReplaceGlobalRef(env, passDataClass, cls.get());
+        passDataMethod = passDataClass ? mid : nullptr;
     }
     // No copy: Java must take the bytes before the call returns, the reader
     // reuses its buffer at once.

@@ -149,6 +149,39 @@ TEST_F(PrintReader, ClosingTheChannelParksTheReaderAndEndsTheJob) {
     EXPECT_EQ(canClose->load(), 0);
 }
 
+// The reader waits up to five minutes for the rest of a UEL job; a close must
+// not wait that out. What the job holds so far, the UEL bytes held at the end
+// of the last transfer included, is its content.
+TEST_F(PrintReader, CloseDuringAnOpenUelJobReturnsAtOnceAndEndsTheJob) {
+    StartReader();
+    if (HasFatalFailure()) return;
+    const std::string head = kUel + "@PJL ENTER LANGUAGE=PCL\r\npages so far", cut = kUel.substr(0, 5);
+    Send({head, cut});
+    ASSERT_TRUE(WaitUntil([] {
+        std::vector<int> t = vdev::PollTimeouts(vdev::kPrn);
+        return vdev::PendingHostBytes(vdev::kPrn) == 0 && vdev::PollsInProgress(vdev::kPrn) > 0 && !t.empty() &&
+               t.back() == 300000;
+    }));
+    std::atomic<jint> r{-1};
+    std::atomic<bool> returned{false};
+    jobject service = daemon_;
+    jvm::StartDetached(
+        [&, service](JNIEnv *) {
+            r = jvm::CallInt(service, "USBPrintDrvClose", "()I");
+            returned = true;
+        },
+        "close");
+    const bool prompt = WaitUntil([&] { return returned.load(); }, 10000);
+    if (!prompt) vdev::ExpirePoll(vdev::kPrn);  // let the close end before the test does
+    ASSERT_TRUE(prompt || WaitUntil([&] { return returned.load(); }, 10000));
+    EXPECT_TRUE(prompt) << "the close waited for the reader's poll";
+    EXPECT_EQ(r.load(), 1);
+    ExpectJob(0, head + cut);
+    EXPECT_EQ(LoggerHost_Count(
+                  "[USBAdp]NotifyEndOfData() called when usb cable is plugged out in between of data transfer\n"),
+              1);
+}
+
 TEST_F(PrintReader, FortyMebibyteJobInMebibyteTransfersArrivesWhole) {
     StartReader();
     if (HasFatalFailure()) return;

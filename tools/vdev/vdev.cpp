@@ -716,8 +716,10 @@ size_t Opens(const char *path) {
 void HostWrite(const char *path, const void *data, size_t size) {
     int i = NodeIndex(path);
     const uint8_t *p = static_cast<const uint8_t *>(data);
+    // Copied before the lock: a reader of any node must not wait for the copy.
+    std::vector<uint8_t> transfer(p, p + size);
     std::lock_guard lk(M().mu);
-    PushTransfer(M().nodes[i], std::vector<uint8_t>(p, p + size));
+    PushTransfer(M().nodes[i], std::move(transfer));
 }
 
 void HostWrite(const char *path, const std::string &bytes) { HostWrite(path, bytes.data(), bytes.size()); }
