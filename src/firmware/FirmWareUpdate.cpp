@@ -422,7 +422,14 @@ S32 FirmWareDownload(S32 fdPrn, U8 *command, U32 commandlen, U8 *firmware_comman
         return FW_FAIL;
     }
     USBADP_LOG(INFO, "PROGRESS receiving..\r\n");
+    const int limitMs = UpdateManager_ProgressLimitMs();
+    const int64_t progressEnd = Wait_NowMs() + limitMs;
     for (S8 progress = 0; progress < 100;) {
+        if (Wait_NowMs() >= progressEnd) {
+            USBADP_LOG(ERROR, "PROGRESS not done within %d s\r\n", limitMs / 1000);
+            USBADP_LOG(ERROR, "Download of FirmWare Failed\r\n");
+            return FW_FAIL;
+        }
         // A manager that falls silent or closes here would otherwise be read
         // as progress 0 for ever: a pair that does not come ends the download.
         UpdMgrResponse kind, percent;

@@ -23,6 +23,7 @@
 namespace {
 
 std::atomic<int> g_waitOverrideMs{-1};
+std::atomic<int> g_progressLimitMs{-1};
 
 int waitMs(U32 seconds) {
     if (seconds == 0) return -1;
@@ -45,6 +46,13 @@ constexpr U32 kFwWriteBlock = 0x10000;
 }  // namespace
 
 void UpdateManager_SetWaitMs(int ms) { g_waitOverrideMs = ms; }
+
+void UpdateManager_SetProgressLimitMs(int ms) { g_progressLimitMs = ms; }
+
+int UpdateManager_ProgressLimitMs() {
+    const int forced = g_progressLimitMs.load();
+    return forced >= 0 ? forced : PROGRESS_LIMIT_MS;
+}
 
 S32 connect_server(const char *pub_server_ip) {
     char server[SERVER_IP_BITS] = {};

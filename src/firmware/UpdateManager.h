@@ -70,6 +70,16 @@ UpdMgrResponse recv_data_on_socket(S32 sock, U32 ul_size);
 // Hands the temporary image to the platform's FW_Write in blocks; 0 or -1.
 S32 write_to_update_manager(U32 ul_size);
 
+// All progress reports after "$END" must have come within this time: a
+// manager still below 100 then fails the download. A slow flash of a large
+// image that reports (or is just alive) stays well inside it; a manager stuck
+// below 100 no longer holds the print reader for ever.
+#define PROGRESS_LIMIT_MS (30 * 60 * 1000)
+
+// Tests: the progress limit is `ms` instead (< 0: PROGRESS_LIMIT_MS).
+void UpdateManager_SetProgressLimitMs(int ms);
+int UpdateManager_ProgressLimitMs();
+
 // Tests: every wait of recv_data lasts `ms` instead (< 0: the real length), so
 // a silent manager need not cost seconds per case.
 void UpdateManager_SetWaitMs(int ms);

@@ -34,7 +34,11 @@ const Name kNames[] = {
     {UmMisbehaviour::Silence, "silence"},
     {UmMisbehaviour::EarlyClose, "early-close"},
     {UmMisbehaviour::SlowProgress, "slow-progress"},
+    {UmMisbehaviour::EndlessProgress, "endless-progress"},
 };
+// An endless report still ends: with the library gone, at Stop(), or after
+// this many connection time-outs.
+constexpr int kEndlessTimeouts = 10;
 
 
 // 16-bit big-endian words of a byte stream fed in pieces; an odd last byte is
@@ -365,6 +369,18 @@ bool UpdateManagerSim::serveEnd(int fd) {
     std::vector<int8_t> steps = opt_.progress;
     if (steps.empty()) steps = {10, 40, 70, 100};
     if (m == UmMisbehaviour::ProgressFail) steps = {30, -1};
+    if (m == UmMisbehaviour::EndlessProgress) {
+        const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(opt_.ioTimeoutMs) * kEndlessTimeouts;
+        for (int i = 0; std::chrono::steady_clock::now() < end && !stop_; ++i) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(opt_.slowProgressMs));
+            uint8_t pair[5];
+            std::memcpy(pair, &type, 4);
+            pair[4] = static_cast<uint8_t>(1 + i % 99);
+            // A library that stopped reading must not hold this thread.
+            if (::send(fd, pair, sizeof pair, MSG_NOSIGNAL | MSG_DONTWAIT) != sizeof pair) return false;
+        }
+        return false;
+    }
     for (int8_t p : steps) {
         if (m == UmMisbehaviour::SlowProgress) {
             for (int waited = 0; waited < opt_.slowProgressMs && !stop_; waited += 10)
