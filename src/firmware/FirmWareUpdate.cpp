@@ -1,9 +1,14 @@
 #include "firmware/FirmWareUpdate.h"
 
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <bit>
 #include <cctype>
+#include <cerrno>
+#include <cstdint>
 #include <cstring>
 #include <memory>
 #include <new>
@@ -74,10 +79,134 @@ bool idMatches(const U8 *id, const char *rowId) {
     return true;
 }
 
+// Sum of `words` big-endian 16-bit words, modulo 2^32 (so also modulo
+// 65536): the high bytes and the low bytes summed apart, eight bytes at a time
+// in four 16-bit lanes each, folded before a lane can overflow.
+U32 sumWords(const U8 *p, size_t words) {
+    constexpr uint64_t kLanes = 0x00FF00FF00FF00FFull;
+    constexpr size_t kFoldEvery = 256;  // 256 * 255 fits a 16-bit lane
+    auto fold = [](uint64_t v) { return static_cast<U32>((v & 0xFFFF) + ((v >> 16) & 0xFFFF) + ((v >> 32) & 0xFFFF) + (v >> 48)); };
+    U32 high = 0, low = 0;
+    size_t i = 0;
+    while (words - i >= 4) {
+        const size_t rounds = std::min((words - i) / 4, kFoldEvery);
+        uint64_t first = 0, second = 0;  // little-endian: even, odd offsets
+        for (size_t r = 0; r < rounds; ++r, i += 4) {
+            uint64_t w;
+            std::memcpy(&w, p + 2 * i, sizeof w);
+            first += w & kLanes;
+            second += (w >> 8) & kLanes;
+        }
+        if constexpr (std::endian::native == std::endian::little) {
+            high += fold(first);
+            low += fold(second);
+        } else {
+            high += fold(second);
+            low += fold(first);
+        }
+    }
+    for (; i < words; ++i) {
+        high += p[2 * i];
+        low += p[2 * i + 1];
+    }
+    return (high << 8) + low;
+}
+
 S32 fwFail(const char *line, S32 fdPrn, U32 discard) {
     USBADP_LOG(ERROR, "%s", line);
     flush_usb(fdPrn, static_cast<S32>(discard));
     return FW_FAIL;
+}
+
+// 16-bit big-endian words of a body that arrives in pieces of any length,
+// summed as make_checksum sums the whole: an odd last byte counts as a high
+// byte.
+struct StreamSum {
+    U32 sum;
+    int pending = -1;  // a high byte whose low byte opens the next piece
+
+    void add(const U8 *p, size_t n) {
+        if (n == 0) return;
+        if (pending >= 0) {
+            sum += (static_cast<U32>(pending) << 8) | p[0];
+            pending = -1;
+            ++p;
+            --n;
+        }
+        sum += sumWords(p, n / 2);
+        if (n & 1) pending = p[n - 1];
+    }
+    U16 finish() {
+        if (pending >= 0) sum += static_cast<U32>(pending) << 8;
+        pending = -1;
+        return static_cast<U16>(sum);
+    }
+};
+
+// All of `data` into the file; the count it took.
+size_t writeFile(int fd, const U8 *data, size_t size) {
+    size_t done = 0;
+    while (done < size) {
+        ssize_t n = ::write(fd, data + done, size - done);
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) break;
+        done += static_cast<size_t>(n);
+    }
+    return done;
+}
+
+// The body of one image: off the print channel into the temporary file, and
+// each piece on to the manager as soon as the file holds it, checksummed on
+// the way. The manager gets the bytes the file got, as if the finished file
+// had been sent, followed by the final checksum this returns (0xFFFF when
+// the file did not get the whole body).
+U16 relayImage(S32 fdPrn, S32 sock, U32 size, U16 seed) {
+    std::snprintf(pub_output, sizeof pub_output, "%s", TEMP_FW_IMAGE);
+    UniqueFd file(::open(pub_output, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666));
+    if (!file) {
+        USBADP_LOG(ERROR, "Error: Can't open file(%s).\n", pub_output);
+        flush_usb(fdPrn, static_cast<S32>(size));
+        USBADP_LOG(ERROR, "update_chksum : Temp datafile open error\n");
+        USBADP_LOG(ERROR, "send_file : file open error\n");
+        return 0xFFFF;
+    }
+    BodySender out(sock);
+    StreamSum sum{seed};
+    // A size of 2 GiB or more is negative as a count: no body is taken.
+    S32 left = static_cast<S32>(size);
+    bool whole = left >= 0;
+    std::unique_ptr<U8[]> buf(new U8[BUFFER_SIZE]);
+    while (left > 0) {
+        const size_t want = left < BUFFER_SIZE ? static_cast<size_t>(left) : BUFFER_SIZE;
+        const ssize_t n = Wait_Read(fdPrn, buf.get(), want, channelGone);
+        USBADP_LOG(FINE, "Read bytes on USB [%d]\n", static_cast<int>(n));
+        if (n < 0) {
+            USBADP_LOG(ERROR, "firmWare data Read Error\n");
+            flush_usb(fdPrn, left);
+            whole = false;
+            break;
+        }
+        const size_t kept = writeFile(file.get(), buf.get(), static_cast<size_t>(n));
+        out.Send(buf.get(), kept);
+        if (n == 0 || kept < static_cast<size_t>(n)) {
+            USBADP_LOG(ERROR, "fimware to temp file Write Error\n ");
+            flush_usb(fdPrn, left - static_cast<S32>(n));
+            whole = false;
+            break;
+        }
+        sum.add(buf.get(), kept);
+        left -= static_cast<S32>(n);
+    }
+    file.reset();
+    U16 final = 0xFFFF;
+    if (whole) {
+        final = static_cast<U16>(VERIFY_CHECK_SUM - sum.finish());
+        USBADP_LOG(INFO, "Final Checksum is 0x%04x\n", final);
+    } else {
+        USBADP_LOG(ERROR, "update_chksum : Read Data from file error\n");
+    }
+    out.Finish();
+    return final;
 }
 
 }  // namespace
@@ -106,15 +235,15 @@ U16 make_checksum(const U8 *pub_pool, U32 data_size, U32 chksum_seed) {
         --data_size;
     }
     U16 sum = static_cast<U16>(chksum_seed + oddTerm);
-    for (U32 i = 0; i < data_size / 2; ++i) {
-        const U16 word = ReadBE16(pub_pool + 2 * static_cast<size_t>(i));
-        if (i < kChecksumLoggedWords) {
-            USBADP_LOG(FINE, "=====> uw_data=0x%x, uw_check_sum = 0x%x", word, sum);
-            USBADP_LOG(FINE, " : uw_check_sum + uw_data = 0x%x\r\n", static_cast<U16>(sum + word));
-        }
+    const size_t words = data_size / 2;
+    const size_t logged = words < kChecksumLoggedWords ? words : kChecksumLoggedWords;
+    for (size_t i = 0; i < logged; ++i) {
+        const U16 word = ReadBE16(pub_pool + 2 * i);
+        USBADP_LOG(FINE, "=====> uw_data=0x%x, uw_check_sum = 0x%x", word, sum);
+        USBADP_LOG(FINE, " : uw_check_sum + uw_data = 0x%x\r\n", static_cast<U16>(sum + word));
         sum = static_cast<U16>(sum + word);
     }
-    return sum;
+    return static_cast<U16>(sum + sumWords(pub_pool + 2 * logged, words - logged));
 }
 
 S32 read_from_file(FILE *file, U8 *buffer, U32 size) {
@@ -264,9 +393,7 @@ S32 FirmWareDownload(S32 fdPrn, U8 *command, U32 commandlen, U8 *firmware_comman
         send_to_update_manager(sock, IMG_SIZE, size);
 
         // Failures here show at the manager's checksum verdict.
-        read_fw_into_file(fdPrn, static_cast<S32>(size));
-        const U16 final = update_chksum(running, size);
-        send_file(sock, pub_output);
+        const U16 final = relayImage(fdPrn, sock, size, static_cast<U16>(running));
         USBADP_LOG(INFO, "Writing the Checksum to socket [0x%02x]\r\n", final);
         send_to_update_manager(sock, IMG_CHECKSUM, final);
 
@@ -295,7 +422,14 @@ S32 FirmWareDownload(S32 fdPrn, U8 *command, U32 commandlen, U8 *firmware_comman
         return FW_FAIL;
     }
     USBADP_LOG(INFO, "PROGRESS receiving..\r\n");
+    const int limitMs = UpdateManager_ProgressLimitMs();
+    const int64_t progressEnd = Wait_NowMs() + limitMs;
     for (S8 progress = 0; progress < 100;) {
+        if (Wait_NowMs() >= progressEnd) {
+            USBADP_LOG(ERROR, "PROGRESS not done within %d s\r\n", limitMs / 1000);
+            USBADP_LOG(ERROR, "Download of FirmWare Failed\r\n");
+            return FW_FAIL;
+        }
         // A manager that falls silent or closes here would otherwise be read
         // as progress 0 for ever: a pair that does not come ends the download.
         UpdMgrResponse kind, percent;

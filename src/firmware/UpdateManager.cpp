@@ -2,6 +2,7 @@
 
 #include <arpa/inet.h>
 #include <netinet/in.h>
+#include <netinet/tcp.h>
 #include <sys/socket.h>
 #include <sys/time.h>
 #include <unistd.h>
@@ -22,6 +23,7 @@
 namespace {
 
 std::atomic<int> g_waitOverrideMs{-1};
+std::atomic<int> g_progressLimitMs{-1};
 
 int waitMs(U32 seconds) {
     if (seconds == 0) return -1;
@@ -44,6 +46,13 @@ constexpr U32 kFwWriteBlock = 0x10000;
 }  // namespace
 
 void UpdateManager_SetWaitMs(int ms) { g_waitOverrideMs = ms; }
+
+void UpdateManager_SetProgressLimitMs(int ms) { g_progressLimitMs = ms; }
+
+int UpdateManager_ProgressLimitMs() {
+    const int forced = g_progressLimitMs.load();
+    return forced >= 0 ? forced : PROGRESS_LIMIT_MS;
+}
 
 S32 connect_server(const char *pub_server_ip) {
     char server[SERVER_IP_BITS] = {};
@@ -73,6 +82,10 @@ S32 connect_server(const char *pub_server_ip) {
     const int limit = waitMs(RECEIVE_TIMEOUT) > 0 ? waitMs(RECEIVE_TIMEOUT) : 1;
     timeval tv{limit / 1000, (limit % 1000) * 1000};
     ::setsockopt(sock, SOL_SOCKET, SO_SNDTIMEO, &tv, sizeof tv);
+    // Every request is small and answered: none may wait for an earlier
+    // segment's acknowledgement (the checksum before the verdict would).
+    const int one = 1;
+    ::setsockopt(sock, IPPROTO_TCP, TCP_NODELAY, &one, sizeof one);
     return sock;
 }
 
@@ -116,6 +129,47 @@ S32 send_to_update_manager(S32 sock, U32 ul_type, U32 ul_option) {
     return 0;
 }
 
+bool BodySender::Send(const U8 *data, size_t size) {
+    size_t at = 0;
+    while (!failed_ && at < size) {
+        ssize_t n = ::send(sock_, data + at, size - at, MSG_NOSIGNAL);
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) {
+            USBADP_LOG(ERROR, "send_data : Sending Error!!!\n");
+            USBADP_LOG(ERROR, "send_file : sending error!!!\n");
+            failed_ = true;
+            break;
+        }
+        at += static_cast<size_t>(n);
+        sent_ += static_cast<unsigned long long>(n);
+    }
+    mark();
+    return !failed_;
+}
+
+void BodySender::mark() {
+    // At most a line's worth per call keeps the buffer small; the rest follows.
+    char line[2 * kFileBlocksPerLine];
+    while (marked_ < sent_ / MAX_FILE_BUFFER) {
+        size_t len = 0;
+        while (len + 1 < sizeof line && marked_ < sent_ / MAX_FILE_BUFFER) {
+            line[len++] = '#';
+            if (++marked_ % kFileBlocksPerLine == 0) line[len++] = '\n';
+        }
+        std::fwrite(line, 1, len, stdout);
+    }
+}
+
+S32 BodySender::Finish() {
+    if (failed_) return -1;
+    // A last short block, or the one empty block of an empty body.
+    if (sent_ % MAX_FILE_BUFFER != 0 || sent_ == 0) std::fputc('#', stdout);
+    std::fputc('\n', stdout);
+    std::fflush(stdout);
+    USBADP_LOG(INFO, "Sending Complete...\n");
+    return 0;
+}
+
 S32 send_file(S32 sock, const char *pub_filename) {
     std::unique_ptr<FILE, int (*)(FILE *)> file(std::fopen(pub_filename, "rb"), std::fclose);
     if (!file) {
@@ -129,25 +183,21 @@ S32 send_file(S32 sock, const char *pub_filename) {
         return -1;
     }
     std::rewind(file.get());
-    U8 block[MAX_FILE_BUFFER];
-    long left = size;
-    int blocks = 0;
-    // An empty file still makes one (empty) block.
-    do {
-        const size_t want = static_cast<size_t>(left < MAX_FILE_BUFFER ? left : MAX_FILE_BUFFER);
-        const size_t got = want ? std::fread(block, 1, want, file.get()) : 0;
-        if (got != want || send_data(sock, block, static_cast<U32>(got)) != static_cast<S32>(got)) {
+    // Read in large blocks: the byte stream and the marks are those of 1 KiB
+    // blocks, without a system call per kibibyte.
+    std::unique_ptr<U8[]> block(new U8[kFwWriteBlock]);
+    BodySender out(sock);
+    for (long left = size; left > 0;) {
+        const size_t want = static_cast<size_t>(left < static_cast<long>(kFwWriteBlock) ? left : kFwWriteBlock);
+        const size_t got = std::fread(block.get(), 1, want, file.get());
+        if (got != want) {
             USBADP_LOG(ERROR, "send_file : sending error!!!\n");
             return -1;
         }
+        if (!out.Send(block.get(), got)) return -1;
         left -= static_cast<long>(got);
-        std::fputc('#', stdout);
-        if (++blocks % kFileBlocksPerLine == 0) std::fputc('\n', stdout);
-    } while (left > 0);
-    std::fputc('\n', stdout);
-    std::fflush(stdout);
-    USBADP_LOG(INFO, "Sending Complete...\n");
-    return 0;
+    }
+    return out.Finish();
 }
 
 S32 recv_data(S32 sock, U8 *pub_data, U32 ul_size, U32 ul_wait_time) {

@@ -2,10 +2,13 @@
 
 #include <arpa/inet.h>
 #include <netinet/in.h>
+#include <netinet/tcp.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <bit>
 #include <cerrno>
 #include <chrono>
 #include <cstdio>
@@ -31,29 +34,49 @@ const Name kNames[] = {
     {UmMisbehaviour::Silence, "silence"},
     {UmMisbehaviour::EarlyClose, "early-close"},
     {UmMisbehaviour::SlowProgress, "slow-progress"},
+    {UmMisbehaviour::EndlessProgress, "endless-progress"},
 };
+// An endless report still ends: with the library gone, at Stop(), or after
+// this many connection time-outs.
+constexpr int kEndlessTimeouts = 10;
 
 
 // 16-bit big-endian words of a byte stream fed in pieces; an odd last byte is
-// the high byte of a word.
+// the high byte of a word. The high and the low bytes are summed apart, eight
+// at a time: bytes that share a 16-bit lane of a 64-bit word add up in that
+// lane, emptied into the totals before it can overflow.
 struct WordSum {
-    uint16_t sum = 0;
-    int pending = -1;
+    uint64_t high = 0, low = 0;
+    bool odd = false;  // the next byte is a low byte
     void add(const uint8_t *p, size_t n) {
-        size_t i = 0;
-        if (pending >= 0 && n > 0) {
-            sum = static_cast<uint16_t>(sum + ((pending << 8) | p[0]));
-            pending = -1;
-            i = 1;
+        if (odd && n > 0) {
+            low += *p++;
+            --n;
+            odd = false;
         }
-        for (; i + 1 < n; i += 2) sum = static_cast<uint16_t>(sum + ((p[i] << 8) | p[i + 1]));
-        if (i < n) pending = p[i];
+        while (n >= 8) {
+            const size_t chunk = std::min<size_t>(n / 8, 255) * 8;
+            uint64_t lanesA = 0, lanesB = 0;
+            for (size_t i = 0; i < chunk; i += 8) {
+                uint64_t w;
+                std::memcpy(&w, p + i, 8);
+                lanesA += w & 0x00FF00FF00FF00FFull;
+                lanesB += (w >> 8) & 0x00FF00FF00FF00FFull;
+            }
+            const bool little = std::endian::native == std::endian::little;
+            high += lanes(little ? lanesA : lanesB);
+            low += lanes(little ? lanesB : lanesA);
+            p += chunk;
+            n -= chunk;
+        }
+        for (; n > 0; --n, ++p, odd = !odd) (odd ? low : high) += *p;
     }
-    uint16_t finish() {
-        if (pending >= 0) sum = static_cast<uint16_t>(sum + (pending << 8));
-        pending = -1;
-        return sum;
+    static uint64_t lanes(uint64_t v) {
+        uint64_t total = 0;
+        for (; v; v >>= 16) total += v & 0xFFFF;
+        return total;
     }
+    uint16_t finish() const { return static_cast<uint16_t>((high << 8) + low); }
 };
 
 }  // namespace
@@ -155,6 +178,10 @@ void UpdateManagerSim::acceptLoop() {
         if (::poll(&p, 1, kSliceMs) <= 0) continue;
         int fd = ::accept4(listenFd_, nullptr, nullptr, SOCK_CLOEXEC);
         if (fd < 0) continue;
+        // Each answer goes out when written, not behind the previous one's
+        // acknowledgement.
+        int one = 1;
+        ::setsockopt(fd, IPPROTO_TCP, TCP_NODELAY, &one, sizeof one);
         {
             std::lock_guard<std::mutex> lock(mu_);
             ++connections_;
@@ -259,16 +286,23 @@ bool UpdateManagerSim::serveImage(int fd) {
     WriteBE32(header + 8, img.type);
     sum.add(header, sizeof header);
     WordSum body;
-    std::vector<uint8_t> buf(1 << 16);
+    std::vector<uint8_t> buf(1 << 18);
     uint64_t left = img.size;
     bool whole = true;
     while (left > 0) {
         const size_t want = left < buf.size() ? static_cast<size_t>(left) : buf.size();
-        // Whatever there is, at least one byte.
-        pollfd pfd{fd, POLLIN, 0};
-        int waited = 0;
-        while (!stop_ && waited < opt_.ioTimeoutMs && ::poll(&pfd, 1, kSliceMs) == 0) waited += kSliceMs;
-        ssize_t n = stop_ || waited >= opt_.ioTimeoutMs ? -1 : ::recv(fd, buf.data(), want, 0);
+        // Whatever there is, at least one byte; the wait only when nothing is.
+        ssize_t n = ::recv(fd, buf.data(), want, MSG_DONTWAIT);
+        if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) {
+            pollfd pfd{fd, POLLIN, 0};
+            int waited = 0;
+            while (!stop_ && waited < opt_.ioTimeoutMs && ::poll(&pfd, 1, kSliceMs) == 0) waited += kSliceMs;
+            if (stop_ || waited >= opt_.ioTimeoutMs) {
+                whole = false;
+                break;
+            }
+            continue;
+        }
         if (n < 0 && errno == EINTR) continue;
         if (n <= 0) {
             whole = false;
@@ -335,6 +369,18 @@ bool UpdateManagerSim::serveEnd(int fd) {
     std::vector<int8_t> steps = opt_.progress;
     if (steps.empty()) steps = {10, 40, 70, 100};
     if (m == UmMisbehaviour::ProgressFail) steps = {30, -1};
+    if (m == UmMisbehaviour::EndlessProgress) {
+        const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(opt_.ioTimeoutMs) * kEndlessTimeouts;
+        for (int i = 0; std::chrono::steady_clock::now() < end && !stop_; ++i) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(opt_.slowProgressMs));
+            uint8_t pair[5];
+            std::memcpy(pair, &type, 4);
+            pair[4] = static_cast<uint8_t>(1 + i % 99);
+            // A library that stopped reading must not hold this thread.
+            if (::send(fd, pair, sizeof pair, MSG_NOSIGNAL | MSG_DONTWAIT) != sizeof pair) return false;
+        }
+        return false;
+    }
     for (int8_t p : steps) {
         if (m == UmMisbehaviour::SlowProgress) {
             for (int waited = 0; waited < opt_.slowProgressMs && !stop_; waited += 10)

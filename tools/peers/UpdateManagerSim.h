@@ -26,10 +26,11 @@ enum class UmMisbehaviour {
     Silence,        // never answers anything
     EarlyClose,     // closes the connection instead of giving the verdict
     SlowProgress,   // waits slowProgressMs before each progress pair
+    EndlessProgress,  // a pair below 100 every slowProgressMs until the library lets go
 };
 
 // "none", "checksum-error", "progress-fail", "silence", "early-close",
-// "slow-progress"; false for anything else.
+// "slow-progress", "endless-progress"; false for anything else.
 bool ParseUmMisbehaviour(const std::string &name, UmMisbehaviour *out);
 const char *UmMisbehaviourName(UmMisbehaviour m);
 

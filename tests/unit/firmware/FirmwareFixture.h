@@ -161,6 +161,7 @@ protected:
     void TearDown() override {
         manager_.Stop();
         UpdateManager_SetWaitMs(-1);
+        UpdateManager_SetProgressLimitMs(-1);
         ::unsetenv(UPDATE_PORT_ENV);
         if (fd_ > 0) ::close(fd_);
         vdev::Reset();

@@ -129,6 +129,23 @@ TEST_F(FirmwareTest, ImagesReachTheManagerWithChainedChecksums) {
     EXPECT_EQ(LoggerHost_Count("fw type UI\tProgress 100%\r\n"), 1);
 }
 
+// Pieces of any length from the host, odd ones splitting words: the manager
+// gets the body whole and checksummed, standard output the marks of 1 KiB
+// blocks (68 whole and one short).
+TEST_F(FirmwareTest, BodyInOddPiecesArrivesWholeWithItsMarks) {
+    StartManager();
+    const std::string body = Body(70001, 16);
+    testing::internal::CaptureStdout();
+    Outcome o = Download(Header("E9", static_cast<uint32_t>(body.size())) + body, {78, 1, 3, 4095, 65537});
+    const std::string out = testing::internal::GetCapturedStdout();
+    EXPECT_EQ(o.result, 0);
+    EXPECT_EQ(out, "Convert\n" + std::string(64, '#') + "\n" + std::string(5, '#') + "\n");
+    ASSERT_EQ(manager_.Images().size(), 1u);
+    EXPECT_TRUE(manager_.Images()[0].checksumOk);
+    EXPECT_EQ(ReadFile(manager_.Images()[0].file), body);
+    EXPECT_EQ(ReadFile(TEMP_FW_IMAGE), body);
+}
+
 TEST_F(FirmwareTest, ManagerAnswersDecideTheOutcome) {
     const uint32_t scan = SCAN;
     const std::string tail = "$PRO" + Progress(scan, 50) + Progress(scan, 100) + "$END";
@@ -197,6 +214,41 @@ TEST_F(FirmwareTest, MisbehavingManagerFailsTheDownloadWithinItsTimeOuts) {
         EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(3));
         EXPECT_EQ(o.result, r.result);
         EXPECT_EQ(LoggerHost_Count(r.line), 1);
+        manager_.Stop();
+    }
+}
+
+// Reports below 100 that keep coming are each within the receive wait; only
+// the bound on the whole progress phase ends them. A slow manager that does
+// finish inside the bound is not cut.
+TEST_F(FirmwareTest, ProgressThatNeverReachesItsEndIsCapped) {
+    UpdateManager_SetProgressLimitMs(600);
+    struct Row {
+        UmMisbehaviour m;
+        S32 result;
+        int capped;  // "PROGRESS not done within 0 s" lines
+    } rows[] = {
+        {UmMisbehaviour::EndlessProgress, -1, 1},
+        {UmMisbehaviour::SlowProgress, 0, 0},  // 4 pairs, 50 ms apart
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(peers::UmMisbehaviourName(r.m));
+        LoggerHost_StartCapture();
+        StartManager(r.m);
+        auto t0 = std::chrono::steady_clock::now();
+        QuietStdout quiet;
+        Outcome o = DownloadImages({{"E7", Body(2000, 15)}});
+        const auto took = std::chrono::steady_clock::now() - t0;
+        EXPECT_EQ(o.result, r.result);
+        EXPECT_EQ(LoggerHost_Count("PROGRESS not done within 0 s\r\n"), r.capped);
+        EXPECT_EQ(LoggerHost_Count("timeout!!!\n"), 0);
+        if (r.capped) {
+            EXPECT_GE(took, std::chrono::milliseconds(600));
+            EXPECT_LT(took, std::chrono::seconds(3));
+            // The manager was heard all along, and is let go.
+            EXPECT_GE(LoggerHost_Count("fw type SCAN\tProgress 1%\r\n"), 1);
+            EXPECT_TRUE(manager_.WaitFor([&] { return manager_.Active() == 0; }, 3000));
+        }
         manager_.Stop();
     }
 }

@@ -70,6 +70,10 @@ TEST(FirmwareChecksum, PlainModularSumOfBigEndianWordsWithTheOddByteHigh) {
         {"\x01\x02\x03", 0, 0x0402},                  // odd: 0x0300 + 0x0102
         {"\x80", 0x8000, 0x0000},
         {std::string("\x00\x01\x00", 3), 0xFFFF, 0x0000},
+        // Long enough for the wide path: 2048 * 0xFFFF and 1000 * 0x0102 +
+        // 0x0300 + 0x10, modulo 65536.
+        {std::string(4096, '\xff'), 0, 0xF800},
+        {[] { std::string s; for (int i = 0; i < 1000; ++i) s += "\x01\x02"; return s + "\x03"; }(), 0x10, 0xF2E0},
     };
     for (const Row &r : rows) {
         SCOPED_TRACE(testing::PrintToString(r.data));
