@@ -1,6 +1,6 @@
 // Common set-up of the MAA language tests: an empty symbol table and address
-// map, captured log lines and captured result records, and a few test
-// functions that record how they were called.
+// map, caught log lines and result records, and a few test functions that
+// record how they were called.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -16,29 +16,20 @@
 #include "maa/MAA_MM.h"
 #include "maa/MAA_Parser.h"
 #include "maa/MAA_Symbol.h"
+#include "support/MaaRecords.h"
 
 namespace maatest {
 
-struct Record {
-    U32 enContinue;
-    U32 ulResult;
-    std::string data;
-};
+using namespace maarec;
 
 struct Call {
     std::string function;
     std::vector<U32> words;
 };
 
-inline std::vector<Record> records;
 inline std::vector<Call> calls;
 inline TMAAResult stResult;
 inline U8 aubText[64];
-
-inline void captureRecord(const TMAAResult *r) {
-    records.push_back({r->enContinue, r->ulResult,
-                       std::string(reinterpret_cast<const char *>(r->pubData), r->pubData ? r->ulDataSize : 0)});
-}
 
 inline TMAAResult *finish(const char *name, TMAAResultStatus status = MAA_RESULT_END) {
     std::snprintf(reinterpret_cast<char *>(aubText), sizeof aubText, "%s done", name);
@@ -97,11 +88,11 @@ protected:
     void SetUp() override {
         MAA_SymbolClear();
         MAA_AddrReset();
-        records.clear();
+        written.clear();
         calls.clear();
         texts.clear();
         enSpecialMode = MAA_NORMAL_CMD;
-        MAA_SetResultWriter(&captureRecord);
+        MAA_SetResultWriter(&Capture);
         LoggerHost_StartCapture();
     }
     void TearDown() override {
