@@ -5,34 +5,16 @@
 #include <jni.h>
 
 #include <atomic>
-#include <fstream>
 #include <list>
-#include <sstream>
-#include <string>
-#include <vector>
 
 #include "maa/MAA_Types.h"
-#include "platform/JNIHelp.h"
 #include "print_Hidden.h"
 #include "print_Support.h"
+#include "support/MaaRecords.h"
 
 namespace {
 
-struct Record {
-    U32 enContinue;
-    std::string data;
-    bool operator==(const Record &) const = default;
-};
-std::ostream &operator<<(std::ostream &os, const Record &r) {
-    return os << (r.enContinue == MAA_RESULT_END ? "END " : "CONTINUE ") << '"' << r.data << '"';
-}
-constexpr U32 C = MAA_RESULT_CONTINUE, E = MAA_RESULT_END;
-using Records = std::vector<Record>;
-
-std::vector<Record> written;
-void capture(const TMAAResult *r) {
-    written.push_back({r->enContinue, std::string(reinterpret_cast<const char *>(r->pubData), r->ulDataSize)});
-}
+using namespace maarec;
 
 // The library's shell functions, found once Java has loaded it.
 struct Shell {
@@ -69,7 +51,7 @@ protected:
         StartReader(daemonClass, false);
         if (HasFatalFailure()) return;
         ASSERT_TRUE(sh.Load());
-        sh.SetResultWriter(&capture);
+        sh.SetResultWriter(&Capture);
     }
     void TearDown() override {
         if (sh.SetResultWriter) sh.SetResultWriter(nullptr);
@@ -89,14 +71,10 @@ protected:
         std::string &kept = texts_.emplace_back(text);
         return sh.AddrMap(kept.data(), static_cast<U32>(kept.size() + 1));
     }
-    // Records written at once, then the returned one; and no exception left.
-    Records Seen(const TMAAResult *returned) {
+    // Recs written at once, then the returned one; and no exception left.
+    Recs Seen(const TMAAResult *returned) {
         EXPECT_FALSE(jvm::Env()->ExceptionCheck()) << "a Java exception was left pending";
-        Records all = written;
-        if (returned)
-            all.push_back({returned->enContinue,
-                           std::string(reinterpret_cast<const char *>(returned->pubData), returned->ulDataSize)});
-        return all;
+        return maarec::Seen(returned);
     }
 
     Shell sh;
@@ -126,7 +104,7 @@ TEST_F(MaaJavaCalls, EngineCommandReachesItsJavaMethodAndTheReplyComesBackAsOneF
         SCOPED_TRACE(c.method);
         Command("GetData(7,\"x y\")", "GetData");
         fixtures::SetReply(c.method, c.reply);
-        EXPECT_EQ(Seen(c.call(sh)), (Records{{C, "[ GetData ]"}, {E, c.sent}}));
+        EXPECT_EQ(Seen(c.call(sh)), (Recs{Cont("[ GetData ]"), End(c.sent)}));
         EXPECT_EQ(fixtures::EventLines(), std::vector<std::string>{std::string(c.method) + ":GetData(7,\"x y\")"});
         EXPECT_EQ(LoggerHost_Count("[" + std::string(c.logName) + "] Start===>(GetData(7,\"x y\"))(GetData)\n"), 1);
     }
@@ -137,11 +115,8 @@ TEST_F(MaaJavaCalls, PbaReplyIsSentLineByLineAndEachLineLosesItsCarriageReturn) 
     if (HasFatalFailure()) return;
     Command("FRA_Feed(1,2,3,4)", "FRA_Feed");
     fixtures::SetReply("maaEngMaaStrNormalTest", "Tray1=OK\r\nTray2=NG\r\n" + std::string(80, 'z') + "\r\nEND\r\n");
-    EXPECT_EQ(Seen(sh.PBAStrIFOpt1(0)), (Records{{C, "[ FRA_Feed ]"},
-                                                 {C, "Tray1=OK"},
-                                                 {C, "Tray2=NG"},
-                                                 {C, std::string(63, 'z')},
-                                                 {E, "END"}}));
+    EXPECT_EQ(Seen(sh.PBAStrIFOpt1(0)), (Recs{Cont("[ FRA_Feed ]"), Cont("Tray1=OK"), Cont("Tray2=NG"),
+                                              Cont(std::string(63, 'z')), End("END")}));
 }
 
 TEST_F(MaaJavaCalls, HostBytesThatAreNoModifiedUtf8ReachJavaAsQuestionMarks) {
@@ -157,17 +132,17 @@ TEST_F(MaaJavaCalls, EngineFailuresEndWithTheirTextsAndLeaveNoException) {
     if (HasFatalFailure()) return;
     Command("GetData(1,2)", "GetData");
     fixtures::ReturnNull("maaEngMaaStrNormalTest");
-    EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Records{{C, "[ GetData ]"}, {E, "GetData=NG"}}));
+    EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Recs{Cont("[ GetData ]"), End("GetData=NG")}));
     EXPECT_EQ(LoggerHost_Count("Error in Eng_MaaStrNormalTest()::Return Data(GetData)\n"), 1);
 
     Command("GetData(1,2)", "GetData");
     fixtures::ThrowOn("maaEngMaaStrNormalTest");
-    EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Records{{C, "[ GetData ]"}, {E, "GetData=NG"}}));
+    EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Recs{Cont("[ GetData ]"), End("GetData=NG")}));
     EXPECT_EQ(fixtures::Calls("maaEngMaaStrNormalTest"), 1);
 
     Command("", "GetData");
     sh.SetCmdString(nullptr);
-    EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Records{{C, "[ GetData ]"}, {E, "Failed"}}));
+    EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Recs{Cont("[ GetData ]"), End("Failed")}));
     EXPECT_EQ(LoggerHost_Count("Error in Eng_MaaStrNormalTest()::can't get MAA Command String\n"), 1);
     EXPECT_EQ(fixtures::Calls("maaEngMaaStrNormalTest"), 0);
 }
@@ -191,7 +166,7 @@ TEST_F(MaaJavaCalls, DaemonWithoutTheEngineMethodsGetsFailed) {
     for (const Case &c : cases) {
         SCOPED_TRACE(c.logged);
         Command("ImageStablization(1)", "ImageStablization");
-        EXPECT_EQ(Seen(c.call(sh)), (Records{{C, "[ ImageStablization ]"}, {E, "Failed"}}));
+        EXPECT_EQ(Seen(c.call(sh)), (Recs{Cont("[ ImageStablization ]"), End("Failed")}));
         EXPECT_EQ(LoggerHost_Count(c.logged), 1);
     }
 }
@@ -203,13 +178,13 @@ TEST_F(MaaJavaCalls, GeneralFunctionPassesIdAndArgumentTextsAndSendsTheReplyByIt
     struct Case {
         std::vector<U32> args;
         std::string reply, journaled;
-        Records seen;
+        Recs seen;
     } cases[] = {
-        {{1000000, Map("text")}, "spider:ABC", "1000000,text", {{E, "ABC"}}},
-        {{0, 0xFFFF}, "idpt:L1\r\nL2\r\nL3", "0,65535", {{C, "L1"}, {C, "L2"}, {E, "L3"}}},
-        {{Map(hundred)}, "Volt=3.3\r\n", hundred.substr(0, 99), {{E, "Volt=3.3\r\n"}}},  // no known prefix: whole
-        {{Map("100%% %s")}, "x", "100% %s", {{E, "x"}}},
-        {{}, "", "", {{E, ""}}},
+        {{1000000, Map("text")}, "spider:ABC", "1000000,text", {End("ABC")}},
+        {{0, 0xFFFF}, "idpt:L1\r\nL2\r\nL3", "0,65535", {Cont("L1"), Cont("L2"), End("L3")}},
+        {{Map(hundred)}, "Volt=3.3\r\n", hundred.substr(0, 99), {End("Volt=3.3\r\n")}},  // no known prefix: whole
+        {{Map("100%% %s")}, "x", "100% %s", {End("x")}},
+        {{}, "", "", {End("")}},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.journaled);
@@ -238,7 +213,7 @@ TEST_F(MaaJavaCalls, GeneralFunctionRefusesBadArgumentsWithoutCallingJava) {
         Command("MyFunc(...)", "MyFunc");
         std::vector<U32> args = c.args;
         EXPECT_EQ(sh.General(static_cast<U32>(args.size()), args.data()), nullptr);
-        EXPECT_EQ(Seen(nullptr), Records{});
+        EXPECT_EQ(Seen(nullptr), Recs{});
         EXPECT_EQ(fixtures::Calls("runUsbFunctionCall"), 0);
     }
 }
@@ -248,82 +223,25 @@ TEST_F(MaaJavaCalls, GeneralFunctionWithoutAReplyLogsItAndEndsWithFailed) {
     if (HasFatalFailure()) return;
     U32 args[] = {5};
     Command("Unknown(5)", "Unknown");  // the service serves no such function: null
-    EXPECT_EQ(Seen(sh.General(1, args)), (Records{{E, "Failed"}}));
+    EXPECT_EQ(Seen(sh.General(1, args)), (Recs{End("Failed")}));
     EXPECT_EQ(LoggerHost_Count("Result string is NULL!\n"), 1);
     EXPECT_EQ(fixtures::EventLines(), std::vector<std::string>{"runUsbFunctionCall:Unknown:5"});
 
     Command("Unknown(5)", "Unknown");
     fixtures::ThrowOn("runUsbFunctionCall");
-    EXPECT_EQ(Seen(sh.General(1, args)), (Records{{E, "Failed"}}));
+    EXPECT_EQ(Seen(sh.General(1, args)), (Recs{End("Failed")}));
     EXPECT_EQ(LoggerHost_Count("Result string is NULL!\n"), 1);
 
     Command("SetUIEnable()", "SetUIEnable");  // the service's own answer
-    EXPECT_EQ(Seen(sh.General(0, args)), (Records{{E, "SetUIEnable = OK"}}));
+    EXPECT_EQ(Seen(sh.General(0, args)), (Recs{End("SetUIEnable = OK")}));
 
     // An MAA object without the method.
     auto *maaSlot = hidden::Variable<std::atomic<jobject>>("globalMAAObj");
     ASSERT_NE(maaSlot, nullptr);
     maaSlot->store(jvm::New(fixtures::kDaemonWithoutUpcalls));
     Command("Unknown(5)", "Unknown");
-    EXPECT_EQ(Seen(sh.General(1, args)), (Records{{E, "Failed"}}));
+    EXPECT_EQ(Seen(sh.General(1, args)), (Recs{End("Failed")}));
     EXPECT_EQ(LoggerHost_Count("[MAA] can't find runUsbFunctionCall()\n"), 1);
-}
-
-TEST(JniHelp, RuntimeExceptionHelperRaisesItsTextAndReplacesAPendingOne) {
-    JNIEnv *env = jvm::Env();
-    EXPECT_EQ(jniThrowRuntimeException(env, "Create New jobjectArray is Null"), 0);
-    EXPECT_EQ(jvm::TakeException(env), "java.lang.RuntimeException: Create New jobjectArray is Null");
-    env->ThrowNew(jvm::Class("java/lang/IllegalStateException"), "earlier");
-    EXPECT_EQ(jniThrowRuntimeException(env, "later"), 0);
-    EXPECT_EQ(jvm::TakeException(env), "java.lang.RuntimeException: later");
-}
-
-// The reference service answers so that a host script sees what reached Java,
-// and journals each call.
-TEST(ReferenceService, AnswersEngineAndGeneralCallsRecognisablyAndJournalsThem) {
-    TempRoot root;
-    JNIEnv *env = jvm::Env();
-    jstring key = jvm::Str(env, "usbadapter.outdir"), dir = jvm::Str(env, root.path().c_str());
-    jobject old = jvm::CallStaticObject("java/lang/System", "setProperty",
-                                        "(Ljava/lang/String;Ljava/lang/String;)Ljava/lang/String;", key, dir);
-    for (jobject o : {static_cast<jobject>(key), static_cast<jobject>(dir), old})
-        if (o) env->DeleteLocalRef(o);
-    jobject service = jvm::New(jvm::kReferenceService);
-    ASSERT_NE(service, nullptr);
-
-    const auto call = [env](jobject target, const char *method, const char *sig, auto... args) {
-        auto reply = static_cast<jstring>(jvm::CallObject(target, method, sig, args...));
-        std::string text = reply ? jvm::Text(env, reply) : "(null)";
-        if (reply) env->DeleteLocalRef(reply);
-        return text;
-    };
-    jstring command = jvm::Str(env, "GetSensorTest(3)");
-    EXPECT_EQ(call(service, "maaEngMaaStrNormalTest", "(Ljava/lang/String;)Ljava/lang/String;", command),
-              "OK:GetSensorTest(3)");
-    env->DeleteLocalRef(command);
-
-    jobject maa = jvm::CallObject(service, "getMaaService",
-                                  "()Lcom/tarnwel/vbk/ca/plugin/usbadapter/print/USBMaaService;");
-    ASSERT_NE(maa, nullptr);
-    jstring id = jvm::Str(env, "MyFunc"), a0 = jvm::Str(env, "1"), a1 = jvm::Str(env, "two");
-    jclass stringClass = env->FindClass("java/lang/String");
-    jobjectArray args = env->NewObjectArray(2, stringClass, nullptr);
-    env->SetObjectArrayElement(args, 0, a0);
-    env->SetObjectArrayElement(args, 1, a1);
-    const char *sig = "(Ljava/lang/String;[Ljava/lang/String;)Ljava/lang/String;";
-    EXPECT_EQ(call(maa, "runUsbFunctionCall", sig, id, args), "OK:MyFunc(1,two)");
-    for (jobject o : {static_cast<jobject>(id), static_cast<jobject>(a0), static_cast<jobject>(a1),
-                      static_cast<jobject>(stringClass), static_cast<jobject>(args), maa})
-        env->DeleteLocalRef(o);
-
-    std::ifstream in(root.path() + "/journal.jsonl");
-    std::stringstream journal;
-    journal << in.rdbuf();
-    EXPECT_EQ(journal.str(),
-              "{\"event\":\"call\",\"method\":\"maaEngMaaStrNormalTest\",\"arg\":\"GetSensorTest(3)\","
-              "\"reply\":\"OK:GetSensorTest(3)\"}\n"
-              "{\"event\":\"call\",\"method\":\"runUsbFunctionCall\",\"arg\":\"MyFunc(1,two)\","
-              "\"reply\":\"OK:MyFunc(1,two)\"}\n");
 }
 
 }  // namespace

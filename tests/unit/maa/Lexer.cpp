@@ -70,25 +70,31 @@ TEST_F(Lexer, NamesBeginningWithATypeWordAreThatTypeWord) {
     EXPECT_EQ(names, (std::vector<std::string>{"Int", "in_1x", "_9"}));
 }
 
-TEST_F(Lexer, NumbersAreDecimalOrHexadecimalAndDropOverflowingDigits) {
-    EXPECT_EQ(constant("0x1F"), 31u);
-    EXPECT_EQ(constant("0X1f"), 31u);
-    EXPECT_EQ(constant("010"), 10u);
-    EXPECT_EQ(constant("017"), 17u);
-    EXPECT_EQ(constant("4294967295"), 0xFFFFFFFFu);
-    EXPECT_EQ(constant("4294967296"), 429496729u);
-    EXPECT_EQ(constant("0xFFFFFFFFF"), 0xFFFFFFFFu);
+TEST_F(Lexer, ConstantsAreDecimalHexadecimalOrCharactersAndDropOverflowingDigits) {
+    const std::pair<const char *, U32> cases[] = {
+        {"0x1F", 31},          {"0X1f", 31},        {"010", 10},        {"017", 17},         {"4294967295", 0xFFFFFFFF},
+        {"4294967296", 429496729}, {"0xFFFFFFFFF", 0xFFFFFFFF}, {"'\\n'", 10}, {"'\\x41'", 65}, {"'\\101'", 65},
+        {"'\\777'", 255},    {"'\\''", 39},      {"'a'", 97},
+    };
+    for (const auto &[text, value] : cases) EXPECT_EQ(constant(text), value) << text;
     // "0x" without a digit is the constant 0 and leaves the input at the "0".
     EXPECT_EQ(constant("0xg"), 0u);
     EXPECT_EQ(MAA_TokenDivider(), CONSTANT);
     EXPECT_EQ(run("0x"), 1u);
+    // At most three octal or two hexadecimal digits in an escape.
+    for (const char *text : {"\\1234", "\\x4142"}) {
+        const U8 *p = reinterpret_cast<const U8 *>(text);
+        EXPECT_EQ(MAA_DecodeEscape(&p), text[1] == 'x' ? 0x41 : 0123);
+        EXPECT_EQ(*p, '4');
+    }
+    EXPECT_EQ(tokens("'ab'"), std::vector<U32>{});
+    EXPECT_TRUE(LoggerHost_Contains("\r\ninvalid charactor constant"));
+    EXPECT_FALSE(fMAALineReject);
 }
 
 TEST_F(Lexer, StringToNumberConversion) {
     const U8 *end = nullptr;
-    auto logic = [&end](const char *text, U32 base) {
-        return MAA_Logic(reinterpret_cast<const U8 *>(text), &end, base);
-    };
+    auto logic = [&end](const char *text, U32 base) { return MAA_Logic(reinterpret_cast<const U8 *>(text), &end, base); };
     const char *text = "  -1z";
     EXPECT_EQ(logic(text, 10), ~1u);  // complement, not negation
     EXPECT_EQ(end, reinterpret_cast<const U8 *>(text + 4));
@@ -98,28 +104,6 @@ TEST_F(Lexer, StringToNumberConversion) {
     text = "xyz";
     EXPECT_EQ(logic(text, 10), 0u);
     EXPECT_EQ(end, reinterpret_cast<const U8 *>(text));
-}
-
-TEST_F(Lexer, CharacterConstantsAndEscapes) {
-    EXPECT_EQ(constant("'\\n'"), 10u);
-    EXPECT_EQ(constant("'\\x41'"), 65u);
-    EXPECT_EQ(constant("'\\101'"), 65u);
-    EXPECT_EQ(constant("'\\777'"), 255u);
-    EXPECT_EQ(constant("'\\''"), 39u);
-    EXPECT_EQ(constant("'a'"), 97u);
-
-    const char *text = "\\1234";
-    const U8 *p = reinterpret_cast<const U8 *>(text);
-    EXPECT_EQ(MAA_DecodeEscape(&p), 0123);  // at most three octal digits
-    EXPECT_EQ(*p, '4');
-    text = "\\x4142";
-    p = reinterpret_cast<const U8 *>(text);
-    EXPECT_EQ(MAA_DecodeEscape(&p), 0x41);  // at most two hexadecimal digits
-    EXPECT_EQ(*p, '4');
-
-    EXPECT_EQ(tokens("'ab'"), std::vector<U32>{});
-    EXPECT_TRUE(LoggerHost_Contains("\r\ninvalid charactor constant"));
-    EXPECT_FALSE(fMAALineReject);
 }
 
 TEST_F(Lexer, StringLiteralsAreDecodedRecordedAndAddressable) {
@@ -178,27 +162,6 @@ TEST_F(Lexer, TwentyStringLiteralsFitATwentyFirstRejectsTheLine) {
     EXPECT_TRUE(fMAALineReject);
     EXPECT_EQ(ulAllocCount, 20u);
     EXPECT_TRUE(LoggerHost_Contains("too many string literals"));
-}
-
-TEST_F(Lexer, GetTokenMapsToParserSymbolsAndUngetRepeatsTheToken) {
-    lineBuffer = "abc;integer";
-    MAA_InputSet(reinterpret_cast<const U8 *>(lineBuffer.c_str()));
-    TStackData v{};
-    EXPECT_EQ(MAA_GetToken(&v), 3u);
-    U8 *name = v.pubSymbol;
-    MAA_UngetToken();
-    TStackData again{};
-    EXPECT_EQ(MAA_GetToken(&again), 3u);
-    EXPECT_EQ(again.pubSymbol, name);
-    MAA_Free(name);
-    EXPECT_EQ(MAA_GetToken(&v), 6u);
-    EXPECT_EQ(MAA_GetToken(&v), 48u);
-    EXPECT_EQ(MAA_GetToken(&v), 0u);
-
-    EXPECT_EQ(MAA_GetSymbolCode(LOR), 40u);
-    EXPECT_EQ(MAA_GetSymbolCode(':'), 44u);
-    EXPECT_EQ(MAA_GetSymbolCode(256), 2u);
-    EXPECT_EQ(MAA_GetSymbolCode('['), 0xFFFFFFFFu);
 }
 
 }  // namespace

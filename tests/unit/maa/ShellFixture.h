@@ -1,6 +1,6 @@
 // Common set-up of the MAA language tests: an empty symbol table and address
-// map, captured log lines and captured result records, and a few test
-// functions that record how they were called.
+// map, caught log lines and result records, and a few test functions that
+// record how they were called.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -16,80 +16,55 @@
 #include "maa/MAA_MM.h"
 #include "maa/MAA_Parser.h"
 #include "maa/MAA_Symbol.h"
+#include "support/MaaRecords.h"
 
 namespace maatest {
 
-struct Record {
-    U32 enContinue;
-    U32 ulResult;
-    std::string data;
-};
+using namespace maarec;
 
 struct Call {
     std::string function;
     std::vector<U32> words;
 };
 
-inline std::vector<Record> records;
 inline std::vector<Call> calls;
 inline TMAAResult stResult;
 inline U8 aubText[64];
 
-inline void captureRecord(const TMAAResult *r) {
-    records.push_back({r->enContinue, r->ulResult,
-                       std::string(reinterpret_cast<const char *>(r->pubData), r->pubData ? r->ulDataSize : 0)});
-}
-
-inline TMAAResult *finish(const char *name, TMAAResultStatus status = MAA_RESULT_END) {
+// Records the call; the result is "<name> done".
+inline TMAAResult *called(const char *name, std::vector<U32> words) {
+    calls.push_back({name, std::move(words)});
     std::snprintf(reinterpret_cast<char *>(aubText), sizeof aubText, "%s done", name);
-    stResult = {status, 1, static_cast<U32>(std::strlen(reinterpret_cast<char *>(aubText))), aubText};
+    stResult = {MAA_RESULT_END, 1, static_cast<U32>(std::strlen(reinterpret_cast<char *>(aubText))), aubText};
     return &stResult;
 }
 
 // Test functions of several arities.
-inline TMAAResult *f0() {
-    calls.push_back({"f0", {}});
-    return finish("f0");
-}
-inline TMAAResult *g0() {
-    calls.push_back({"g0", {}});
-    return finish("g0");
-}
-inline TMAAResult *f2(U32 a, U32 b) {
-    calls.push_back({"f2", {a, b}});
-    return finish("f2");
-}
-inline TMAAResult *f3(U32 a, S32 b, U32 c) {
-    calls.push_back({"f3", {a, static_cast<U32>(b), c}});
-    return finish("f3");
-}
+inline TMAAResult *f0() { return called("f0", {}); }
+inline TMAAResult *g0() { return called("g0", {}); }
+inline TMAAResult *f2(U32 a, U32 b) { return called("f2", {a, b}); }
+inline TMAAResult *f3(U32 a, S32 b, U32 c) { return called("f3", {a, static_cast<U32>(b), c}); }
 inline TMAAResult *f10(U32 a, U32 b, U32 c, U32 d, U32 e, U32 f, U32 g, U32 h, U32 i, U32 j) {
-    calls.push_back({"f10", {a, b, c, d, e, f, g, h, i, j}});
-    return finish("f10");
+    return called("f10", {a, b, c, d, e, f, g, h, i, j});
 }
+inline TMAAResult *general(U32 argc, U32 *args) { return called("general", std::vector<U32>(args, args + argc)); }
 // Reads its text argument through the address map.
 inline std::vector<std::string> texts;
 inline TMAAResult *text1(U32 address) {
-    calls.push_back({"text1", {address}});
     const char *t = MAA_AddrString(address);
     texts.push_back(t ? t : "<refused>");
-    return finish("text1");
+    return called("text1", {address});
 }
 inline TMAAResult *silent0() {
-    calls.push_back({"silent0", {}});
+    called("silent0", {});
     stResult = {MAA_RESULT_NONE, 0, 0, nullptr};
     return &stResult;
 }
 // A scanner-side function: writes its own record.
 inline TMAAResult *scan1(U32 a) {
-    calls.push_back({"scan1", {a}});
-    TMAAResult *r = finish("scan1");
+    TMAAResult *r = called("scan1", {a});
     MAA_IF_WriteResult(r);
     return r;
-}
-inline TMAAResult *general(U32 argc, U32 *args) {
-    calls.push_back({"general", std::vector<U32>(args, args + argc)});
-    return finish("general");
 }
 
 class ShellTest : public ::testing::Test {
@@ -97,11 +72,11 @@ protected:
     void SetUp() override {
         MAA_SymbolClear();
         MAA_AddrReset();
-        records.clear();
+        written.clear();
         calls.clear();
         texts.clear();
         enSpecialMode = MAA_NORMAL_CMD;
-        MAA_SetResultWriter(&captureRecord);
+        MAA_SetResultWriter(&Capture);
         LoggerHost_StartCapture();
     }
     void TearDown() override {

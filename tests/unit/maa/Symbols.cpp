@@ -69,22 +69,9 @@ TEST_F(Symbols, TheDumpListsKindOneNamesAndCountsAllButKindFour) {
     EXPECT_EQ(run("MAA_SymbolDump()"), 0u);
 
     const std::string rule = "======================================";
-    std::vector<Record> expected = {
-        {MAA_RESULT_CONTINUE, 0, rule},
-        {MAA_RESULT_CONTINUE, 0, "|                    Symbol Name                 "},
-        {MAA_RESULT_CONTINUE, 0, rule},
-        {MAA_RESULT_CONTINUE, 0, "   SPI_Get_Log  "},
-        {MAA_RESULT_CONTINUE, 0, "   Pattern_Print  "},
-        {MAA_RESULT_CONTINUE, 0, rule},
-        {MAA_RESULT_CONTINUE, 1, "The Number Of Symbol : 3 "},
-        {MAA_RESULT_END, 1, ""},
-    };
-    ASSERT_EQ(records.size(), expected.size());
-    for (size_t i = 0; i < expected.size(); ++i) {
-        EXPECT_EQ(records[i].enContinue, expected[i].enContinue) << i;
-        EXPECT_EQ(records[i].ulResult, expected[i].ulResult) << i;
-        EXPECT_EQ(records[i].data, expected[i].data) << i;
-    }
+    EXPECT_EQ(written, (Recs{Cont(rule, 0), Cont("|                    Symbol Name                 ", 0), Cont(rule, 0),
+                             Cont("   SPI_Get_Log  ", 0), Cont("   Pattern_Print  ", 0), Cont(rule, 0),
+                             Cont("The Number Of Symbol : 3 ", 1), End("", 1)}));
     EXPECT_TRUE(LoggerHost_Contains("unknown(2) "));
 }
 

@@ -6,48 +6,38 @@
 
 #include "maa/functions/MAA_FaxJbig.h"
 #include "maa/functions/MAA_ScanDriver.h"
-#include "maa_functions/DriverFixture.h"
+#include "maa_functions/FnFixture.h"
 #include "usbadapter/maadrivers.h"
 
-using namespace drivertest;
-
+namespace fntest {
 namespace {
 
-using FaxJbig = DriverTest;
+using FaxJbig = FnTest;
 
-struct FaxCase {
-    std::function<TMAAResult *()> call;
-    std::string name, line;
-    bool scannerLock;
-};
-
-const std::vector<FaxCase> &FaxCases() {
-    static const std::vector<FaxCase> cases = {
-        {[] { return SetSpeakerTest(2); }, "SetSpeakerTest", "SetSpeakerTest(2)", false},
-        {[] { return SysPBA_IO_Fax_GPITest(1, 2, 3); }, "SysPBA_IO_Fax_GPITest", "SysPBA_IO_Fax_GPITest(1,2,3)", true},
-        {[] { return SysPBA_IO_Fax_GPOTest(1, 0, 0xFFFFFFFFu, 4); }, "SysPBA_IO_Fax_GPOTest",
-         "SysPBA_IO_Fax_GPOTest(1,0,4294967295,4)", true},
-        {[] { return PhoneTest_OHD(1, 2, 3); }, "PhoneTest_OHD", "PhoneTest_OHD(1,2,3)", true},
-        {[] { return PhoneTest_Dial(5, 5, 5); }, "PhoneTest_Dial", "PhoneTest_Dial(5,5,5)", true},
-        {[] { return PhoneTest_Ring(0, 1); }, "PhoneTest_Ring", "PhoneTest_Ring(0,1)", true},
-        {[] { return UART_Test_FAX(9600, 8, 0, 1); }, "UART_Test_FAX", "UART_Test_FAX(9600,8,0,1)", true},
-        {[] { return FaxModuleDetect_To_SCB(); }, "FaxModuleDetect_To_SCB", "FaxModuleDetect_To_SCB()", false},
+TEST_F(FaxJbig, EachFaxNameSendsItsLineAndWritesHeaderAndResponse) {
+    struct Case {
+        const char *shell, *name, *line;
+        bool scannerLock;
+    } cases[] = {
+        {"SPI_Set_Speaker_Test(2)", "SetSpeakerTest", "SetSpeakerTest(2)", false},
+        {"SysPBA_IO_Fax_GPITest(1,2,3)", "SysPBA_IO_Fax_GPITest", "SysPBA_IO_Fax_GPITest(1,2,3)", true},
+        {"SysPBA_IO_Fax_GPOTest(1,0,0xFFFFFFFF,4)", "SysPBA_IO_Fax_GPOTest", "SysPBA_IO_Fax_GPOTest(1,0,4294967295,4)",
+         true},
+        {"PhoneTest_OHD(1,2,3)", "PhoneTest_OHD", "PhoneTest_OHD(1,2,3)", true},
+        {"PhoneTest_Dial(5,5,5)", "PhoneTest_Dial", "PhoneTest_Dial(5,5,5)", true},
+        {"PhoneTest_Ring(0,1)", "PhoneTest_Ring", "PhoneTest_Ring(0,1)", true},
+        {"UART_Test_FAX(9600,8,0,1)", "UART_Test_FAX", "UART_Test_FAX(9600,8,0,1)", true},
+        {"Fax_Modul_Detect()", "FaxModuleDetect_To_SCB", "FaxModuleDetect_To_SCB()", false},
     };
-    return cases;
-}
-
-TEST_F(FaxJbig, EachFaxFunctionSendsItsLineAndWritesHeaderAndResponse) {
-    for (const FaxCase &c : FaxCases()) {
-        SCOPED_TRACE(c.line);
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.shell);
         Restart();
         vdev::SetFaxTestAnswer({"LINE OK", std::nullopt, 1, 0});
-        c.call();
+        ASSERT_EQ(Run(c.shell), 0u);
         EXPECT_EQ(vdev::FaxCommands(), std::vector<std::string>{c.line});
-        EXPECT_EQ(records, (std::vector<Record>{Cont("[ " + c.name + " ]"), End1("LINE OK")}));
-        const std::vector<unsigned long> expected =
-            c.scannerLock ? std::vector<unsigned long>{IOCNR_SCAN_APP_LOCK, IOCNR_SCAN_APP_LOCK_RELEASE}
-                          : std::vector<unsigned long>{};
-        EXPECT_EQ(Requests(vdev::kScanner), expected);
+        EXPECT_EQ(written, (Recs{Cont("[ " + std::string(c.name) + " ]", 1), End("LINE OK", 1)}));
+        const std::vector<unsigned long> locked{IOCNR_SCAN_APP_LOCK, IOCNR_SCAN_APP_LOCK_RELEASE};
+        EXPECT_EQ(Requests(vdev::kScanner), c.scannerLock ? locked : std::vector<unsigned long>{});
         EXPECT_EQ(vdev::Opens(vdev::kScanner), c.scannerLock ? 1u : 0u);
         EXPECT_EQ(vdev::OpenCount(vdev::kScanner) + vdev::OpenCount(vdev::kFax), 0);
         EXPECT_EQ(fdFaxDrv, -1);
@@ -60,24 +50,29 @@ TEST_F(FaxJbig, WithoutAResponseTextTheVerdictFollowsTheDriversSuccess) {
         std::string response;
         std::optional<uint32_t> result;
         uint32_t success;
-        Record last;
-    };
-    const std::vector<Case> cases = {
-        {"", std::nullopt, 1, End1("PhoneTest_Ring DONE")},
-        {"", std::nullopt, 0, End0("PhoneTest_Ring FAIL")},
-        {"NO DIAL TONE", std::nullopt, 0, End0("NO DIAL TONE")},
+        Rec last;
+    } cases[] = {
+        {"", std::nullopt, 1, End("PhoneTest_Ring DONE", 1)},
+        {"", std::nullopt, 0, End("PhoneTest_Ring FAIL", 0)},
+        {"NO DIAL TONE", std::nullopt, 0, End("NO DIAL TONE", 0)},
         // The count bounds the text; a count past the record is cut to it.
-        {"RING 3 TIMES", 6u, 1, End1("RING 3")},
-        {std::string(1500, 'r'), 0xFFFFFFFFu, 1, End1(std::string(FAX_MAA_RESPONSE_LENGTH, 'r'))},
+        {"RING 3 TIMES", 6u, 1, End("RING 3", 1)},
+        {std::string(1500, 'r'), 0xFFFFFFFFu, 1, End(std::string(FAX_MAA_RESPONSE_LENGTH, 'r'), 1)},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.last.data);
         Restart();
         vdev::SetFaxTestAnswer({c.response, c.result, c.success, 0});
         PhoneTest_Ring(1, 1);
-        ASSERT_EQ(records.size(), 2u);
-        EXPECT_EQ(records[1], c.last);
+        ASSERT_EQ(written.size(), 2u);
+        EXPECT_EQ(written[1], c.last);
     }
+    // The speaker test needs no scanner.
+    Restart();
+    vdev::SetPresent(vdev::kScanner, false);
+    vdev::SetFaxTestAnswer({"", std::nullopt, 1, 0});
+    SetSpeakerTest(1);
+    EXPECT_EQ(written.back(), End("SetSpeakerTest DONE", 1));
 }
 
 TEST_F(FaxJbig, FailedStepsAreNamedAndTheLockIsNeverLeftHeld) {
@@ -97,7 +92,7 @@ TEST_F(FaxJbig, FailedStepsAreNamedAndTheLockIsNeverLeftHeld) {
         Restart();
         c.script();
         PhoneTest_OHD(1, 2, 3);
-        EXPECT_EQ(records, (std::vector<Record>{Cont("[ PhoneTest_OHD ]"), End0(c.text)}));
+        EXPECT_EQ(written, (Recs{Cont("[ PhoneTest_OHD ]", 1), End(c.text, 0)}));
         const std::vector<unsigned long> req = Requests(vdev::kScanner);
         EXPECT_EQ(CountOf(req, IOCNR_SCAN_APP_LOCK), c.lockAttempts);
         EXPECT_EQ(CountOf(req, IOCNR_SCAN_APP_LOCK_RELEASE), c.releases);
@@ -105,13 +100,6 @@ TEST_F(FaxJbig, FailedStepsAreNamedAndTheLockIsNeverLeftHeld) {
         EXPECT_FALSE(vdev::ScanLocked());
         EXPECT_EQ(sleeps.size(), c.lockAttempts ? c.lockAttempts - 1 : 0);
     }
-}
-
-TEST_F(FaxJbig, TheSpeakerTestNeedsNoScanner) {
-    vdev::SetPresent(vdev::kScanner, false);
-    vdev::SetFaxTestAnswer({"", std::nullopt, 1, 0});
-    SetSpeakerTest(1);
-    EXPECT_EQ(records.back(), End1("SetSpeakerTest DONE"));
 }
 
 TEST_F(FaxJbig, HWJBIGTestChecksEncoderThenDecoder) {
@@ -132,9 +120,8 @@ TEST_F(FaxJbig, HWJBIGTestChecksEncoderThenDecoder) {
         SCOPED_TRACE(c.verdict);
         Restart();
         c.script();
-        TMAAResult *r = HWJBIGTest(5);
-        EXPECT_EQ(records, std::vector<Record>{Cont("[ HWJBIGTest : Argument=5 ]")});
-        EXPECT_EQ(Returned(r), End1(c.verdict));  // the shell writes it
+        // The shell writes the returned verdict.
+        EXPECT_EQ(Seen(HWJBIGTest(5)), (Recs{Cont("[ HWJBIGTest : Argument=5 ]", 1), End(c.verdict, 1)}));
         EXPECT_EQ(vdev::JbigResets(vdev::kJbigDec), c.decoderResets);
         EXPECT_EQ(vdev::OpenCount(vdev::kJbigEnc) + vdev::OpenCount(vdev::kJbigDec), 0);
     }
@@ -149,3 +136,4 @@ TEST_F(FaxJbig, HWJBIGTestChecksEncoderThenDecoder) {
 }
 
 }  // namespace
+}  // namespace fntest

@@ -1,59 +1,32 @@
 // The operator-panel tests against a real UI-server peer on loopback: the bytes
 // the server receives and the records the host receives (the lines written at
 // once, then the returned record, which the shell writes too).
-#include <gtest/gtest.h>
-
 #include <chrono>
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <functional>
-#include <string>
-#include <vector>
 
-#include "LoggerHost.h"
 #include "UiPeer.h"
-#include "support/TempRoot.h"
-#include "maa/MAA_IF.h"
-#include "maa/MAA_Result.h"
 #include "maa/functions/MAA_Panel.h"
+#include "maa_functions/FnFixture.h"
 
+namespace fntest {
 namespace {
-
-struct Record {
-    U32 enContinue;
-    std::string text;
-    bool operator==(const Record &) const = default;
-};
-std::ostream &operator<<(std::ostream &os, const Record &r) {
-    return os << (r.enContinue == MAA_RESULT_END ? "END " : "CONTINUE ") << '"' << r.text << '"';
-}
-
-std::vector<Record> written;
-void capture(const TMAAResult *r) {
-    written.push_back({r->enContinue, std::string(reinterpret_cast<const char *>(r->pubData),
-                                                  r->pubData ? r->ulDataSize : 0)});
-}
-
-Record cont(const std::string &text) { return {MAA_RESULT_CONTINUE, text}; }
-Record end(const std::string &text) { return {MAA_RESULT_END, text}; }
 
 const std::string kAddressFile = "/root/Halvard/osgi/socketAddress.prop";
 
-class PanelTest : public ::testing::Test {
+class Panel : public FnTest {
 protected:
     void SetUp() override {
-        written.clear();
-        enSpecialMode = MAA_NORMAL_CMD;
-        MAA_SetResultWriter(&capture);
+        FnTest::SetUp();
         MAA_PanelSetWaits(2000, 2000, 2000);
         std::filesystem::create_directories(root / "/root/Halvard/osgi");
         writeAddress("127.000.000.001");  // inet_addr reads the zeros as octal: 127.0.0.1
     }
     void TearDown() override {
-        MAA_SetResultWriter(nullptr);
         ::unsetenv("USBADAPTER_UI_PORT");
         MAA_PanelSetWaits(0, 0, 0);
+        FnTest::TearDown();
     }
 
     void writeAddress(const std::string &text) { std::ofstream(root / kAddressFile, std::ios::binary) << text; }
@@ -61,99 +34,72 @@ protected:
 
     // What the host receives from one call: the records written at once, then
     // the returned one.
-    static std::vector<Record> hostSees(const std::function<TMAAResult *()> &call) {
+    static Recs hostSees(const std::function<TMAAResult *()> &call) {
         written.clear();
         TMAAResult *r = call();
         EXPECT_EQ(r, &stMAASysResult);
-        capture(r);
-        return written;
+        return Seen(r);
     }
-
-    TempRoot root;
 };
 
 using Call = std::function<TMAAResult *()>;
 
-TEST_F(PanelTest, ClientTestsSendTheirRequestAndMapTheAnswer) {
+TEST_F(Panel, ClientTestsSendTheirRequestAndMapTheAnswer) {
+    using Answers = std::vector<std::pair<std::string, std::string>>;  // answer, final record
     struct Case {
-        const char *name;
         Call call;
-        std::string request, answer, header, final;
+        std::string request, header;
+        Answers answers;
     } cases[] = {
-        {"key in", [] { return UISSM_IF_KeyInTest_And_Cli(5); }, std::string("1\x05", 2), "9",
-         "[ UISSM_IF_KeyInTest : Argument=5 ]", "KEY TEST DONE"},
-        {"key in fails", [] { return UISSM_IF_KeyInTest_And_Cli(5); }, std::string("1\x05", 2), "x9",
-         "[ UISSM_IF_KeyInTest : Argument=5 ]", "KEY TEST FAIL"},
-        {"led", [] { return UISSM_IF_LED_Test_And_Cli(1); }, "2\x01", "9", "[ UISSM_IF_LED_Test : Argument=1 ]",
-         "LED TEST DONE"},
-        {"led fails", [] { return UISSM_IF_LED_Test_And_Cli(1); }, "2\x01", "1",
-         "[ UISSM_IF_LED_Test : Argument=1 ]", "LED TEST FAIL"},
-        {"wait", UISSM_IF_Key_WaitTest_And_Cli, "3", "9", "[ UISSM_IF_Key_WaitTest ]", "WAIT TEST DONE"},
-        {"wait fails", UISSM_IF_Key_WaitTest_And_Cli, "3", "3", "[ UISSM_IF_Key_WaitTest ]", "WAIT TEST FAIL"},
-        {"lcd", UISSM_IF_Key_LCD_Test_And_Cli, "4", "9", "[ UISSM_IF_Key_LCD_Test ]", "LCD TEST DONE"},
-        {"lcd fails", UISSM_IF_Key_LCD_Test_And_Cli, "4", "0", "[ UISSM_IF_Key_LCD_Test ]", "LCD TEST FAIL"},
-        {"country", UISSM_MAA_CountrySkip_And_Cli, "5", "9", "[ UISSM_MAA_CountrySkip ]", "COUNTRY SKIP DONE"},
-        {"country fails", UISSM_MAA_CountrySkip_And_Cli, "5", "x", "[ UISSM_MAA_CountrySkip ]",
-         "COUNTRY SKIP FAIL"},
-        {"tray", UISSM_MAA_TrayConfirmSkip_And_Cli, "6", "9", "[ UISSM_MAA_TrayConfirmSkip ]",
-         "TRAY CONFIRM SKIP DONE"},
-        {"tray fails", UISSM_MAA_TrayConfirmSkip_And_Cli, "6", "x", "[ UISSM_MAA_TrayConfirmSkip ]",
-         "TRAY CONFIRM SKIP FAIL"},
-        {"power save on", [] { return SPI_Set_UI_Power_Save_And_Cli(1); }, "7", "9",
-         "[ SPI_Set_UI_Power_Save : Argument=1 ]", "SPI_Set_UI_Power_Save DONE"},
-        {"power save off", [] { return SPI_Set_UI_Power_Save_And_Cli(0); }, "8", "x",
-         "[ SPI_Set_UI_Power_Save : Argument=0 ]", "SPI_Set_UI_Power_Save FAIL"},
-        {"power save other: one zero byte", [] { return SPI_Set_UI_Power_Save_And_Cli(2); }, std::string(1, '\0'),
-         "9", "[ SPI_Set_UI_Power_Save : Argument=2 ]", "SPI_Set_UI_Power_Save DONE"},
-        {"tsp 0", [] { return UISSM_MAA_TSPCalibration_Result_And_Cli(0); }, "0", "9",
-         "[ UISSM_MAA_TSPCalibration_Result : Argument=0 ]", "UISSM_MAA_TSPCalibration_Result DONE"},
-        {"tsp ok", [] { return UISSM_MAA_TSPCalibration_Result_And_Cli(0); }, "0", "1",
-         "[ UISSM_MAA_TSPCalibration_Result : Argument=0 ]", "Result= OK"},
-        {"tsp ng", [] { return UISSM_MAA_TSPCalibration_Result_And_Cli(0); }, "0", "2",
-         "[ UISSM_MAA_TSPCalibration_Result : Argument=0 ]", "Result= NG"},
-        {"tsp other: one zero byte", [] { return UISSM_MAA_TSPCalibration_Result_And_Cli(7); },
-         std::string(1, '\0'), "3", "[ UISSM_MAA_TSPCalibration_Result : Argument=7 ]",
-         "UISSM_MAA_TSPCalibration_Result FAIL"},
-        {"ui clear", PbaMode_UI_Data_clear, "9", "9", "[ PbaMode_UI_Data_clear ]", "UI Clear = OK"},
-        {"ui clear fails", PbaMode_UI_Data_clear, "9", "8", "[ PbaMode_UI_Data_clear ]", "UI Clear = NG"},
-        {"get ui old", SPI_Get_UI, "A", "1", "[ SPI_Get_UI ]", "SPI_Get_UI = OLD"},
-        {"get ui new", SPI_Get_UI, "A", "2", "[ SPI_Get_UI ]", "SPI_Get_UI = NEW"},
-        {"get ui: 9 is no success here", SPI_Get_UI, "A", "9", "[ SPI_Get_UI ]", "SPI_Get_UI = FAIL"},
-        {"reboot", SPI_Set_UI_Reboot, "B", "9", "[ SPI_Set_UI_Reboot ]", "UI Reboot = OK"},
-        {"reboot fails", SPI_Set_UI_Reboot, "B", "x", "[ SPI_Set_UI_Reboot ]", "UI Reboot = FAIL"},
-        {"key sound 0 is on", [] { return UISSM_MAA_Set_KeySound_And_Cli(0); }, std::string("C\0", 2), "9",
-         "[ UISSM_MAA_Set_KeySound : Argument = 0 ]", "Key Sound On = OK"},
-        {"key sound on fails", [] { return UISSM_MAA_Set_KeySound_And_Cli(0); }, std::string("C\0", 2), "1",
-         "[ UISSM_MAA_Set_KeySound : Argument = 0 ]", "Key Sound On = NG"},
-        {"key sound 1 is off", [] { return UISSM_MAA_Set_KeySound_And_Cli(1); }, "C\x01", "9",
-         "[ UISSM_MAA_Set_KeySound : Argument = 1 ]", "Key Sound Off = OK"},
-        {"key sound off fails", [] { return UISSM_MAA_Set_KeySound_And_Cli(1); }, "C\x01", "0",
-         "[ UISSM_MAA_Set_KeySound : Argument = 1 ]", "Key Sound Off = NG"},
-        {"mic", UISSM_MAA_MIC_Test_And_Cli, "D", "9", "[ UISSM_MAA_MIC_Test ]", "MIC TEST DONE"},
-        {"mic fails", UISSM_MAA_MIC_Test_And_Cli, "D", "x", "[ UISSM_MAA_MIC_Test ]", "MIC TEST FAIL"},
-        {"haptic: the argument's low byte", [] { return UISSM_MAA_HAPTIC_And_Cli(0x1FF); }, "E\xFF", "9",
-         "[ UISSM_MAA_HAPTIC : Argument=511 ]", "HAPTIC TEST DONE"},
-        {"haptic fails", [] { return UISSM_MAA_HAPTIC_And_Cli(3); }, "E\x03", "x",
-         "[ UISSM_MAA_HAPTIC : Argument=3 ]", "HAPTIC TEST FAIL"},
-        {"speaker: the fax speaker test's name", [] { return UISSM_MAA_SpeakerTest_And_Cli(0xFFFFFFFFu); },
-         "F\xFF", "9", "[ SPI_Set_Speaker_Test : Argument=-1 ]", "[SPI_Set_Speaker_Test] DONE"},
-        {"speaker fails", [] { return UISSM_MAA_SpeakerTest_And_Cli(2); }, "F\x02", "x",
-         "[ SPI_Set_Speaker_Test : Argument=2 ]", "[SPI_Set_Speaker_Test] FAIL"},
-        {"usb", UISSM_MAA_USB_Test_And_Cli, "G", "9", "[ UISSM_MAA_USB_Test ]", "OK"},
-        {"usb fails", UISSM_MAA_USB_Test_And_Cli, "G", "x", "[ UISSM_MAA_USB_Test ]", "NG"},
+        {[] { return UISSM_IF_KeyInTest_And_Cli(5); }, std::string("1\x05", 2), "[ UISSM_IF_KeyInTest : Argument=5 ]",
+         {{"9", "KEY TEST DONE"}, {"x9", "KEY TEST FAIL"}}},
+        {[] { return UISSM_IF_LED_Test_And_Cli(1); }, "2\x01", "[ UISSM_IF_LED_Test : Argument=1 ]",
+         {{"9", "LED TEST DONE"}, {"1", "LED TEST FAIL"}}},
+        {UISSM_IF_Key_WaitTest_And_Cli, "3", "[ UISSM_IF_Key_WaitTest ]", {{"9", "WAIT TEST DONE"}, {"3", "WAIT TEST FAIL"}}},
+        {UISSM_IF_Key_LCD_Test_And_Cli, "4", "[ UISSM_IF_Key_LCD_Test ]", {{"9", "LCD TEST DONE"}, {"0", "LCD TEST FAIL"}}},
+        {UISSM_MAA_CountrySkip_And_Cli, "5", "[ UISSM_MAA_CountrySkip ]",
+         {{"9", "COUNTRY SKIP DONE"}, {"x", "COUNTRY SKIP FAIL"}}},
+        {UISSM_MAA_TrayConfirmSkip_And_Cli, "6", "[ UISSM_MAA_TrayConfirmSkip ]",
+         {{"9", "TRAY CONFIRM SKIP DONE"}, {"x", "TRAY CONFIRM SKIP FAIL"}}},
+        {[] { return SPI_Set_UI_Power_Save_And_Cli(1); }, "7", "[ SPI_Set_UI_Power_Save : Argument=1 ]",
+         {{"9", "SPI_Set_UI_Power_Save DONE"}}},
+        {[] { return SPI_Set_UI_Power_Save_And_Cli(0); }, "8", "[ SPI_Set_UI_Power_Save : Argument=0 ]",
+         {{"x", "SPI_Set_UI_Power_Save FAIL"}}},
+        {[] { return SPI_Set_UI_Power_Save_And_Cli(2); }, std::string(1, '\0'), "[ SPI_Set_UI_Power_Save : Argument=2 ]",
+         {{"9", "SPI_Set_UI_Power_Save DONE"}}},  // any other: one zero byte
+        {[] { return UISSM_MAA_TSPCalibration_Result_And_Cli(0); }, "0", "[ UISSM_MAA_TSPCalibration_Result : Argument=0 ]",
+         {{"9", "UISSM_MAA_TSPCalibration_Result DONE"}, {"1", "Result= OK"}, {"2", "Result= NG"}}},
+        {[] { return UISSM_MAA_TSPCalibration_Result_And_Cli(7); }, std::string(1, '\0'),
+         "[ UISSM_MAA_TSPCalibration_Result : Argument=7 ]", {{"3", "UISSM_MAA_TSPCalibration_Result FAIL"}}},
+        {PbaMode_UI_Data_clear, "9", "[ PbaMode_UI_Data_clear ]", {{"9", "UI Clear = OK"}, {"8", "UI Clear = NG"}}},
+        {SPI_Get_UI, "A", "[ SPI_Get_UI ]",
+         {{"1", "SPI_Get_UI = OLD"}, {"2", "SPI_Get_UI = NEW"}, {"9", "SPI_Get_UI = FAIL"}}},  // 9 is no success here
+        {SPI_Set_UI_Reboot, "B", "[ SPI_Set_UI_Reboot ]", {{"9", "UI Reboot = OK"}, {"x", "UI Reboot = FAIL"}}},
+        {[] { return UISSM_MAA_Set_KeySound_And_Cli(0); }, std::string("C\0", 2), "[ UISSM_MAA_Set_KeySound : Argument = 0 ]",
+         {{"9", "Key Sound On = OK"}, {"1", "Key Sound On = NG"}}},  // 0 is on
+        {[] { return UISSM_MAA_Set_KeySound_And_Cli(1); }, "C\x01", "[ UISSM_MAA_Set_KeySound : Argument = 1 ]",
+         {{"9", "Key Sound Off = OK"}, {"0", "Key Sound Off = NG"}}},
+        {UISSM_MAA_MIC_Test_And_Cli, "D", "[ UISSM_MAA_MIC_Test ]", {{"9", "MIC TEST DONE"}, {"x", "MIC TEST FAIL"}}},
+        {[] { return UISSM_MAA_HAPTIC_And_Cli(0x1FF); }, "E\xFF", "[ UISSM_MAA_HAPTIC : Argument=511 ]",
+         {{"9", "HAPTIC TEST DONE"}, {"x", "HAPTIC TEST FAIL"}}},  // the argument's low byte
+        {[] { return UISSM_MAA_SpeakerTest_And_Cli(0xFFFFFFFFu); }, "F\xFF", "[ SPI_Set_Speaker_Test : Argument=-1 ]",
+         {{"9", "[SPI_Set_Speaker_Test] DONE"}, {"x", "[SPI_Set_Speaker_Test] FAIL"}}},  // the fax speaker test's name
+        {UISSM_MAA_USB_Test_And_Cli, "G", "[ UISSM_MAA_USB_Test ]", {{"9", "OK"}, {"x", "NG"}}},
     };
     for (const Case &c : cases) {
-        SCOPED_TRACE(c.name);
-        uipeer::Server server(uipeer::AnswerAll(c.answer));
-        ASSERT_TRUE(server.ok());
-        usePort(server.port());
-        EXPECT_EQ(hostSees(c.call), (std::vector<Record>{cont(c.header), end(c.final)}));
-        ASSERT_TRUE(server.awaitServed(1, 2000));
-        EXPECT_EQ(server.requests(), std::vector<std::string>{c.request});
+        for (const auto &[answer, final] : c.answers) {
+            SCOPED_TRACE(c.header + " answered " + answer);
+            uipeer::Server server(uipeer::AnswerAll(answer));
+            ASSERT_TRUE(server.ok());
+            usePort(server.port());
+            EXPECT_EQ(hostSees(c.call), (Recs{Cont(c.header), End(final)}));
+            ASSERT_TRUE(server.awaitServed(1, 2000));
+            EXPECT_EQ(server.requests(), std::vector<std::string>{c.request});
+        }
     }
 }
 
-TEST_F(PanelTest, WithoutAnAnswerTheHeaderIsTheLastRecord) {
+TEST_F(Panel, WithoutAnAnswerTheHeaderIsTheLastRecord) {
     struct Case {
         const char *name;
         Call call;
@@ -178,13 +124,13 @@ TEST_F(PanelTest, WithoutAnAnswerTheHeaderIsTheLastRecord) {
         ASSERT_TRUE(server.ok());
         usePort(server.port());
         const auto start = std::chrono::steady_clock::now();
-        EXPECT_EQ(hostSees(c.call), (std::vector<Record>{cont(c.header), cont(c.header)}));
+        EXPECT_EQ(hostSees(c.call), (Recs{Cont(c.header), Cont(c.header)}));
         EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));  // not the operator's minutes
         EXPECT_EQ(server.requests().size(), 1u);
     }
 }
 
-TEST_F(PanelTest, TheAddressComesFromItsFileElseTheDefault) {
+TEST_F(Panel, TheAddressComesFromItsFileElseTheDefault) {
     // The peer listens on 127.0.0.1 only: any other address finds nobody.
     struct Case {
         const char *name;
@@ -210,29 +156,29 @@ TEST_F(PanelTest, TheAddressComesFromItsFileElseTheDefault) {
         const auto records = hostSees(UISSM_MAA_USB_Test_And_Cli);
         LoggerHost_StopCapture();
         if (c.reached) {
-            EXPECT_EQ(records.back(), end("OK"));
+            EXPECT_EQ(records.back(), End("OK"));
             EXPECT_TRUE(server.awaitServed(++served, 2000));
         } else {
-            EXPECT_EQ(records, (std::vector<Record>{cont("[ UISSM_MAA_USB_Test ]"), end("Connect To UIServer Fails")}));
+            EXPECT_EQ(records, (Recs{Cont("[ UISSM_MAA_USB_Test ]"), End("Connect To UIServer Fails")}));
             EXPECT_TRUE(LoggerHost_Contains(c.logged));
         }
     }
     EXPECT_EQ(server.requests().size(), served);
 }
 
-TEST_F(PanelTest, ListeningTestsAcceptOnlyAnAnswerBeginningWithTheirCommand) {
+TEST_F(Panel, ListeningTestsAcceptOnlyAnAnswerBeginningWithTheirCommand) {
     struct Case {
         const char *name;
         Call call;
         std::vector<std::string> answers;
-        std::vector<Record> records;
+        Recs records;
         std::string peerReceived;  // the command, then '3' padded to the answer's length
     } cases[] = {
         {"key test", UISSM_IF_KeyInTest, {"2", "x", "1ab"},
-         {cont("[ UISSM_IF_KeyInTest ]"), end("KEY TEST DONE")}, std::string("13\0\0", 4)},
-        {"led test", UISSM_IF_LED_Test, {"2"}, {cont("[ UISSM_IF_LED_Test ]"), end("LED TEST DONE")}, "23"},
+         {Cont("[ UISSM_IF_KeyInTest ]"), End("KEY TEST DONE")}, std::string("13\0\0", 4)},
+        {"led test", UISSM_IF_LED_Test, {"2"}, {Cont("[ UISSM_IF_LED_Test ]"), End("LED TEST DONE")}, "23"},
         {"closed without answer", UISSM_IF_KeyInTest, {},
-         {cont("[ UISSM_IF_KeyInTest ]"), cont("[ UISSM_IF_KeyInTest ]")}, "1"},
+         {Cont("[ UISSM_IF_KeyInTest ]"), Cont("[ UISSM_IF_KeyInTest ]")}, "1"},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.name);
@@ -247,22 +193,23 @@ TEST_F(PanelTest, ListeningTestsAcceptOnlyAnAnswerBeginningWithTheirCommand) {
     }
 }
 
-TEST_F(PanelTest, ListeningTestsNameTheStepThatFailed) {
+TEST_F(Panel, ListeningTestsNameTheStepThatFailed) {
     // Nobody connects in time.
     MAA_PanelSetWaits(2000, 50, 2000);
     usePort(uipeer::FreePort());
-    EXPECT_EQ(hostSees(UISSM_IF_LED_Test), (std::vector<Record>{cont("[ UISSM_IF_LED_Test ]"),
-                                                                end("Accept from UIServer Fails")}));
+    EXPECT_EQ(hostSees(UISSM_IF_LED_Test), (Recs{Cont("[ UISSM_IF_LED_Test ]"),
+                                                                End("Accept from UIServer Fails")}));
     // The port is taken by a listener.
     uipeer::Server other(uipeer::AnswerAll("9"));
     ASSERT_TRUE(other.ok());
     usePort(other.port());
-    EXPECT_EQ(hostSees(UISSM_IF_KeyInTest), (std::vector<Record>{cont("[ UISSM_IF_KeyInTest ]"),
-                                                                 end("Bind To UIServer Fails")}));
+    EXPECT_EQ(hostSees(UISSM_IF_KeyInTest), (Recs{Cont("[ UISSM_IF_KeyInTest ]"),
+                                                                 End("Bind To UIServer Fails")}));
 }
 
-TEST_F(PanelTest, SetUIEnableWithoutThePrintServiceFails) {
-    EXPECT_EQ(hostSees(SetUIEnable), (std::vector<Record>{cont("[ SetUIEnable ]"), end("Failed")}));
+TEST_F(Panel, SetUIEnableWithoutThePrintServiceFails) {
+    EXPECT_EQ(hostSees(SetUIEnable), (Recs{Cont("[ SetUIEnable ]"), End("Failed")}));
 }
 
 }  // namespace
+}  // namespace fntest

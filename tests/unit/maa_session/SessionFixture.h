@@ -23,23 +23,15 @@
 #include "maa/MAA_MM.h"
 #include "maa/MAA_Result.h"
 #include "maa/MAA_Symbol.h"
+#include "support/MaaRecords.h"
 #include "vdev.h"
 #include "vendor/VLX_Main.h"
 
 namespace maasession {
 
-inline const std::string kAck("\x1bwMAA-OK", 8);
+using namespace maarec;
 
-inline std::string BE32(U32 v) {
-    std::string s(4, '\0');
-    WriteBE32(reinterpret_cast<U8 *>(s.data()), v);
-    return s;
-}
-// A result frame as the host receives it.
-inline std::string Frame(U32 cont, U32 result, const std::string &data) {
-    return BE32(cont) + BE32(result) + BE32(static_cast<U32>(data.size())) + data;
-}
-inline std::string Transfer(U8 op, U32 size) { return std::string("#$%") + static_cast<char>(op) + BE32(size) + BE32(size); }
+inline const std::string kAck("\x1bwMAA-OK", 8);
 // A special command line, host to device.
 inline std::string Special(U8 code, U32 size) { return std::string("#$%") + static_cast<char>(code) + BE32(size) + "\r"; }
 // A literal with NUL bytes in it.

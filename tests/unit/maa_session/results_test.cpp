@@ -7,8 +7,6 @@
 
 #include <csignal>
 #include <cstdio>
-#include <fstream>
-#include <sstream>
 #include <thread>
 
 #include "support/TempRoot.h"
@@ -17,19 +15,6 @@
 
 namespace maasession {
 namespace {
-
-std::string Pattern(size_t n) {
-    std::string s(n, '\0');
-    for (size_t i = 0; i < n; ++i) s[i] = static_cast<char>(i * 7 + 3);
-    return s;
-}
-
-std::string ReadFile(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
-}
 
 class ResultTest : public ::testing::Test {
 protected:
@@ -50,13 +35,7 @@ protected:
         MAA_SetResultWriter(nullptr);
         LoggerHost_StopCapture();
     }
-    // The device's writes, one string each.
-    std::vector<std::string> Writes() {
-        std::vector<std::string> out;
-        std::string buf(1 << 16, '\0');
-        for (ssize_t n; (n = ::recv(sp[1], buf.data(), buf.size(), MSG_DONTWAIT)) >= 0;) out.push_back(buf.substr(0, n));
-        return out;
-    }
+    std::vector<std::string> Writes() { return maarec::Writes(sp[1]); }
     int sp[2] = {-1, -1};
 };
 

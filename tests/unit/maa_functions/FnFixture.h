@@ -1,0 +1,95 @@
+// One set-up for the test-function tests: clean virtual devices and address
+// map, the session's channel on the virtual print node, a private root, and
+// the records, commands, pauses and log lines caught instead of sent or run.
+#pragma once
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <string>
+#include <vector>
+
+#include "LoggerHost.h"
+#include "adapter/USB.h"
+#include "maa/MAA_Address.h"
+#include "maa/MAA_Hook.h"
+#include "maa/MAA_IF.h"
+#include "maa/MAA_Parser.h"
+#include "maa/MAA_Symbol.h"
+#include "maa/MAA_Result.h"
+#include "maa/functions/MAA_SysResult.h"
+#include "support/MaaRecords.h"
+#include "support/TempRoot.h"
+#include "vdev.h"
+#include "vendor/VLX_Main.h"
+
+namespace fntest {
+
+using namespace maarec;
+
+// Requests made on a node, in order.
+inline std::vector<unsigned long> Requests(const char *path) {
+    std::vector<unsigned long> out;
+    for (const vdev::IoctlCall &c : vdev::Ioctls(path)) out.push_back(c.request);
+    return out;
+}
+inline size_t CountOf(const std::vector<unsigned long> &requests, unsigned long request) {
+    return static_cast<size_t>(std::count(requests.begin(), requests.end(), request));
+}
+
+class FnTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        MAA_AddrReset();
+        IsDisconnected = 0;
+        enSpecialMode = MAA_NORMAL_CMD;
+        MAA_SetResultWriter(&Capture);
+        MAA_SetCommandRunner(&RecordCommand);
+        MAA_SetSleeper(&RecordSleep);
+        LoggerHost_StartCapture();
+        Restart();
+        ASSERT_GT(channel, 0);
+    }
+    void TearDown() override {
+        ::close(channel);
+        vdev::Reset();
+        MAA_AddrReset();
+        MAA_SetResultWriter(nullptr);
+        MAA_SetCommandRunner(nullptr);
+        MAA_SetSleeper(nullptr);
+        MAA_SetCmdString(nullptr);
+        MAA_SymbolClear();
+        LoggerHost_StopCapture();
+    }
+    // A clean model, channel and catch, also between the rows of a table.
+    void Restart() {
+        if (channel > 0) ::close(channel);
+        vdev::Reset();
+        channel = ::open(vdev::kPrn, O_RDWR);
+        ulDrvHandle = static_cast<U32>(channel);
+        written.clear();
+        commands.clear();
+        sleeps.clear();
+    }
+    // A command line through the shell, with the registered vocabulary.
+    static U32 Run(const std::string &line) {
+        if (pstRoot == nullptr) MAA_SymbolReg();
+        static std::string kept;
+        kept = line;
+        MAA_InputSet(reinterpret_cast<const U8 *>(kept.c_str()));
+        return MAA_Parser();
+    }
+    // Bytes the device sent on the session's channel other than by the writer.
+    static std::string Wire() {
+        std::vector<uint8_t> b = vdev::HostRead(vdev::kPrn);
+        return {b.begin(), b.end()};
+    }
+
+    TempRoot root;
+    int channel = -1;
+};
+
+}  // namespace fntest
