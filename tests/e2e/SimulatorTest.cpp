@@ -292,29 +292,6 @@ TEST_F(Simulator, PlugAndUnplugAsTheHostDoes) {
     EXPECT_LT(started - plugged, 600);
 }
 
-TEST_F(Simulator, JournalNumbersEveryLineAndMergesEveryJavaLine) {
-    WriteFile(Path("a.prn"), UelJob(PrintData(300, 12)) + UelJob(PrintData(200, 13)));
-
-    ASSERT_EQ(RunScript("send prn file:a.prn\nexpect-jobs 2\nread prn\n"), 0);
-
-    std::vector<Event> all = Journal();
-    ASSERT_FALSE(all.empty());
-    std::vector<std::string> merged;
-    for (size_t i = 0; i < all.size(); ++i) {
-        EXPECT_EQ(all[i]["seq"], std::to_string(i + 1));
-        EXPECT_TRUE(all[i].src == "host" || all[i].src == "java" || all[i].src == "sim") << all[i].line;
-        EXPECT_EQ(all[i].line.front(), '{');
-        EXPECT_EQ(all[i].line.back(), '}');
-        if (all[i].src == "java") merged.push_back(all[i].line.substr(all[i].line.find("\"event\"")));
-    }
-    std::vector<std::string> java;
-    std::istringstream in(ReadFile(Out("journal.jsonl")));
-    for (std::string line; std::getline(in, line);) java.push_back(line.substr(1));
-    EXPECT_EQ(merged, java);
-    EXPECT_EQ(Events("host", "read").at(0)["bytes"], "0");
-    EXPECT_EQ(all.back().event, "end");
-}
-
 TEST_F(Simulator, ScanSampleSessionPasses) {
     ASSERT_EQ(Run({"--script", std::string(USBADAPTER_SOURCE_DIR) + "/tools/sim/samples/scan.sim"}), 0);
     EXPECT_EQ(Events("sim", "expect").size(), 15u);
