@@ -2,15 +2,10 @@
 // runs the simulator on them and checks what came out: the exit status, the
 // session journal and the job files the Java side wrote. The simulator's own
 // output is echoed so that JNI complaints fail the test.
-#include <fcntl.h>
-#include <signal.h>
-#include <spawn.h>
 #include <sys/wait.h>
-#include <unistd.h>
 
 #include <gtest/gtest.h>
 
-#include <chrono>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -18,12 +13,9 @@
 #include <regex>
 #include <sstream>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "Sha256.h"
-
-extern char **environ;
 
 namespace {
 
@@ -38,34 +30,30 @@ std::string ReadFile(const std::string &path) {
     return all.str();
 }
 
-void WriteFile(const std::string &path, const std::string &bytes) {
-    std::ofstream(path, std::ios::binary) << bytes;
-}
+void WriteFile(const std::string &path, const std::string &bytes) { std::ofstream(path, std::ios::binary) << bytes; }
 
 // Print data as a driver makes it: no ESC, so no stray selector or UEL.
 std::string PrintData(size_t n, unsigned seed) {
     std::mt19937 gen(seed);
     std::string s(n, '\0');
     for (char &c : s) {
-        c = static_cast<char>(gen() & 0xFF);
-        if (c == '\x1b') c = 'E';
+        const char v = static_cast<char>(gen() & 0xFF);
+        c = v == '\x1b' ? 'E' : v;
     }
     return s;
 }
 
 std::string UelJob(const std::string &body) { return kUel + "@PJL ENTER LANGUAGE=PCL\r\n" + body + kUel; }
 
-// A string or number field of one journal line ("" when absent).
-std::string Field(const std::string &line, const std::string &key) {
-    std::smatch m;
-    std::regex re("\"" + key + "\":(\"([^\"]*)\"|(-?[0-9]+|true|false))");
-    if (!std::regex_search(line, m, re)) return {};
-    return m[2].matched ? m[2].str() : m[3].str();
-}
-
+// One journal line; a string or number field by name ("" when absent).
 struct Event {
     std::string src, event, line;
-    std::string operator[](const std::string &key) const { return Field(line, key); }
+    std::string operator[](const std::string &key) const {
+        std::smatch m;
+        if (!std::regex_search(line, m, std::regex("\"" + key + "\":(\"([^\"]*)\"|(-?[0-9]+|true|false))")))
+            return {};
+        return m[2].matched ? m[2].str() : m[3].str();
+    }
 };
 
 class Simulator : public ::testing::Test {
@@ -83,39 +71,15 @@ protected:
     std::string Path(const std::string &name) const { return dir_ + "/" + name; }
     std::string Out(const std::string &name) const { return dir_ + "/out/" + name; }
 
-    // Runs the simulator with `args` (after the output directory option);
-    // returns its exit status, -1 when it had to be killed.
-    int Run(std::vector<std::string> args) {
-        args.insert(args.begin(), {USBADAPTER_SIM, "--out", dir_ + "/out", "--timeout", "8000"});
-        std::vector<char *> argv;
-        for (auto &a : args) argv.push_back(a.data());
-        argv.push_back(nullptr);
-        posix_spawn_file_actions_t actions;
-        posix_spawn_file_actions_init(&actions);
-        const std::string log = Path("sim-output.txt");
-        posix_spawn_file_actions_addopen(&actions, 1, log.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-        posix_spawn_file_actions_adddup2(&actions, 1, 2);
-        pid_t pid = -1;
-        int rc = posix_spawn(&pid, argv[0], &actions, nullptr, argv.data(), environ);
-        posix_spawn_file_actions_destroy(&actions);
-        if (rc != 0) {
-            ADD_FAILURE() << "cannot start " << argv[0];
-            return -1;
-        }
-        int status = 0;
-        auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(45);
-        while (waitpid(pid, &status, WNOHANG) == 0) {
-            if (std::chrono::steady_clock::now() > deadline) {
-                kill(pid, SIGKILL);
-                waitpid(pid, &status, 0);
-                ADD_FAILURE() << "the simulator did not finish";
-                return -1;
-            }
-            std::this_thread::sleep_for(std::chrono::milliseconds(20));
-        }
-        output_ = ReadFile(log);
+    // Runs the simulator with `args` (no blanks in them); its exit status, 137
+    // when it had to be killed.
+    int Run(const std::vector<std::string> &args) {
+        std::string cmd = "timeout -s KILL 45 " USBADAPTER_SIM " --out " + dir_ + "/out --timeout 8000";
+        for (const std::string &a : args) cmd += " '" + a + "'";
+        const int status = std::system((cmd + " >" + Path("sim-output.txt") + " 2>&1").c_str());
+        output_ = ReadFile(Path("sim-output.txt"));
         std::fputs(output_.c_str(), stdout);
-        return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+        return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
     }
 
     int RunScript(const std::string &script, std::vector<std::string> extra = {}) {
@@ -127,8 +91,10 @@ protected:
     std::vector<Event> Journal() const {
         std::vector<Event> events;
         std::istringstream in(ReadFile(Out("session.jsonl")));
-        for (std::string line; std::getline(in, line);)
-            events.push_back({Field(line, "src"), Field(line, "event"), line});
+        for (std::string line; std::getline(in, line);) {
+            Event e{"", "", line};
+            events.push_back({e["src"], e["event"], line});
+        }
         return events;
     }
     std::vector<Event> Events(const std::string &src, const std::string &event) const {
@@ -138,10 +104,10 @@ protected:
         return out;
     }
     // Position of the first matching event in the journal, -1 when absent.
-    int IndexOf(const std::string &src, const std::string &event, int from = 0) const {
+    int IndexOf(const std::string &src, const std::string &event) const {
         std::vector<Event> all = Journal();
-        for (int i = from; i < static_cast<int>(all.size()); ++i)
-            if (all[i].src == src && all[i].event == event) return i;
+        for (size_t i = 0; i < all.size(); ++i)
+            if (all[i].src == src && all[i].event == event) return static_cast<int>(i);
         return -1;
     }
 
@@ -149,81 +115,46 @@ protected:
     std::string output_;
 };
 
-TEST_F(Simulator, UelFramedJobArrivesAsOneJobEndedByItsClosingUel) {
-    const std::string job = UelJob(PrintData(20000, 1));
-    WriteFile(Path("job.prn"), job);
+// Jobs whatever the transfer cuts: inside the opening and the closing UEL, two
+// jobs in one transfer, a job larger than one read of the reader, and a job
+// without UEL that only the host's silence ends.
+TEST_F(Simulator, PrintJobsArriveByteExactWhereverTheCutsFall) {
+    const std::string cut = UelJob(PrintData(3000, 2)), first = UelJob(PrintData(700, 3)),
+                      second = UelJob(PrintData(900, 4)), big = UelJob(PrintData(2600000, 6)),
+                      raw = PrintData(6000, 5);
+    WriteFile(Path("cut.prn"), cut);
+    WriteFile(Path("both.prn"), first + second);
+    WriteFile(Path("big.prn"), big);
+    WriteFile(Path("raw.prn"), raw);
+    const size_t closing = cut.size() - kUel.size();
+    const std::string chunks = "1,3,5,100," + std::to_string(closing - 109 - 4) + ",4,2";
 
-    ASSERT_EQ(RunScript("send prn file:job.prn\nexpect-jobs 1\n"), 0);
+    ASSERT_EQ(RunScript("send prn file:cut.prn chunks " + chunks + "\nexpect-jobs 1\nsend prn file:both.prn\n"
+                        "expect-jobs 3\nsend prn file:big.prn every 65536\nexpect-jobs 4\nsend prn file:raw.prn\n"
+                        "wait-idle\nexpect-jobs 4\nsilence prn\nexpect-jobs 5\n"),
+              0);
 
+    const std::string jobs[] = {cut, first, second, big, raw};
+    for (int i = 0; i < 5; ++i) EXPECT_EQ(ReadFile(Out("job-00" + std::to_string(i + 1) + ".prn")), jobs[i]) << i;
+    auto sends = Events("host", "send");
     auto ends = Events("java", "job-end");
-    ASSERT_EQ(ends.size(), 1u);
-    EXPECT_EQ(ends[0]["bytes"], std::to_string(job.size()));
-    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
-    EXPECT_EQ(Events("java", "job-start").size(), 1u);
-    // The closing UEL ended it: the host never had to stay silent.
-    EXPECT_TRUE(Events("host", "silence").empty());
+    ASSERT_EQ(sends.size(), 4u);
+    ASSERT_EQ(ends.size(), 5u);
+    EXPECT_EQ(sends[0]["transfers"], "8");
+    EXPECT_EQ(sends[2]["sha256"], sim::Sha256Hex(big));
+    EXPECT_EQ(ends[3]["sha256"], sim::Sha256Hex(big));
+    EXPECT_EQ(ends[3]["bytes"], std::to_string(big.size()));
+    // The UELs ended the first four jobs; the fifth was open while the host sent
+    // and ended only by its silence.
+    const auto seq = [](const Event &e) { return std::stol(e["seq"]); };
+    const long silence = seq(Events("host", "silence").at(0));
+    EXPECT_LT(seq(ends[3]), silence);
+    EXPECT_LT(seq(Events("java", "job-start").at(4)), silence);
+    EXPECT_GT(seq(ends[4]), silence);
     EXPECT_EQ(Events("sim", "end").at(0)["status"], "passed");
 }
 
-TEST_F(Simulator, JobSplitAcrossTransfersIsReassembledWhereverTheCutsFall) {
-    const std::string job = UelJob(PrintData(3000, 2));
-    WriteFile(Path("job.prn"), job);
-    // Cuts inside the opening UEL, inside the body and inside the closing UEL.
-    const size_t closing = job.size() - kUel.size();
-    const std::string chunks = "1,3,5,100," + std::to_string(closing - 109 - 4) + ",4,2";
-
-    ASSERT_EQ(RunScript("send prn file:job.prn chunks " + chunks + "\nexpect-jobs 1\n"), 0);
-
-    auto sends = Events("host", "send");
-    ASSERT_EQ(sends.size(), 1u);
-    EXPECT_EQ(sends[0]["transfers"], "8");
-    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
-    EXPECT_EQ(Events("java", "job-end").size(), 1u);
-}
-
-TEST_F(Simulator, TwoJobsInOneTransferAreCutAtTheirUels) {
-    const std::string first = UelJob(PrintData(700, 3)), second = UelJob(PrintData(900, 4));
-    WriteFile(Path("both.prn"), first + second);
-
-    ASSERT_EQ(RunScript("send prn file:both.prn\nexpect-jobs 2\n"), 0);
-
-    EXPECT_EQ(ReadFile(Out("job-001.prn")), first);
-    EXPECT_EQ(ReadFile(Out("job-002.prn")), second);
-    EXPECT_EQ(Events("java", "job-start").size(), 2u);
-}
-
-TEST_F(Simulator, JobWithoutUelEndsOnlyWhenTheHostStaysSilent) {
-    const std::string data = PrintData(6000, 5);
-    WriteFile(Path("raw.prn"), data);
-
-    ASSERT_EQ(RunScript("send prn file:raw.prn\nwait-idle\nexpect-jobs 0\nsilence prn\nexpect-jobs 1\n"), 0);
-
-    int silence = IndexOf("host", "silence");
-    int end = IndexOf("java", "job-end");
-    ASSERT_GE(silence, 0);
-    EXPECT_GT(end, silence);
-    EXPECT_LT(IndexOf("java", "job-start"), silence);  // the job was open while the host sent
-    EXPECT_EQ(ReadFile(Out("job-001.prn")), data);
-}
-
-TEST_F(Simulator, Sha256OfAJobOverSeveralReadsEqualsWhatTheHostSent) {
-    // Larger than one 1 MiB read of the reader.
-    const std::string job = UelJob(PrintData(2600000, 6));
-    WriteFile(Path("big.prn"), job);
-
-    ASSERT_EQ(RunScript("send prn file:big.prn every 65536\nexpect-jobs 1\n"), 0);
-
-    const std::string sha = sim::Sha256Hex(job);
-    auto sends = Events("host", "send");
-    auto ends = Events("java", "job-end");
-    ASSERT_EQ(sends.size(), 1u);
-    ASSERT_EQ(ends.size(), 1u);
-    EXPECT_EQ(sends[0]["sha256"], sha);
-    EXPECT_EQ(ends[0]["sha256"], sha);
-    EXPECT_EQ(ends[0]["bytes"], std::to_string(job.size()));
-    EXPECT_EQ(sim::Sha256Hex(ReadFile(Out("job-001.prn"))), sha);
-}
-
+// Every other end-to-end check rests on a failed expectation failing.
 TEST_F(Simulator, FailedExpectationStopsTheSessionWithStatusOne) {
     WriteFile(Path("one.prn"), UelJob("x"));
 
@@ -241,18 +172,49 @@ TEST_F(Simulator, FailedExpectationStopsTheSessionWithStatusOne) {
     EXPECT_NE(output_.find("session FAILED"), std::string::npos);
 }
 
+// Status 1: the session ran and an expectation failed; 2: the script is refused
+// before the session starts.
+TEST_F(Simulator, ScriptsThatMustFailDoWithTheirReason) {
+    WriteFile(Path("job.prn"), UelJob("abc"));
+    WriteFile(Path("other.prn"), UelJob("abd"));
+    const struct {
+        const char *script;
+        int status;
+        const char *why;  // in the simulator's output
+    } cases[] = {
+        {"send prn file:job.prn\nexpect-job 1 equals file:other.prn\n", 1, "session FAILED"},
+        {"set timeout 300\nexpect-read prn hex:41\n", 1, "session FAILED"},
+        {"send prn file:missing.prn\n", 1, "cannot read"},
+        {"send prn slice:4:99999:job.prn\n", 1, "session FAILED"},  // past the file's end
+        {"scan-start\nsend scan hex:1ba8280100\nexpect-app 1 ids\n", 1, "is of type pcscan"},
+        {"scan-start\nsend scan hex:1ba8280100\nexpect-app 1 pcscan equals hex:1ba8280101\n", 1, "holds 1ba8280100"},
+        {"scan-start\nset timeout 300\nsend scan hex:1b24f407000000000000\nexpect-capability scan size\n", 1,
+         "read back ,"},
+        {"send prn uel\nsend prn hex:1b2\n", 2, "session.sim:2"},
+        {"plug\nsendd prn uel\n", 2, "unknown command 'sendd'"},
+        {"send prn uel chunks random:9-3:1\n", 2, "session.sim:1"},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.script);
+        fs::remove_all(Out(""));
+        EXPECT_EQ(RunScript(c.script), c.status);
+        EXPECT_NE(output_.find(c.why), std::string::npos);
+        EXPECT_EQ(fs::exists(Out("journal.jsonl")), c.status == 1);
+    }
+}
+
 // A slice of a file at random transfer sizes (the same cuts for the same seed,
 // each within the bounds), state shown without waiting, and failed expectations
 // counted while the script goes on.
 TEST_F(Simulator, SliceAtSeededRandomSizesWithQueriesAndExpectationsThatGoOn) {
-    const std::string body = PrintData(50000, 9), file = "head" + UelJob(body) + "tail";
-    WriteFile(Path("f.bin"), file);
-    const std::string job = UelJob(body);
-    const std::string send = "send prn slice:4:" + std::to_string(job.size()) + ":f.bin chunks random:1-700:7\n";
+    const std::string job = UelJob(PrintData(50000, 9));
+    WriteFile(Path("f.bin"), "head" + job + "tail");
+    const std::string slice = "slice:4:" + std::to_string(job.size()) + ":f.bin";
+    const std::string send = "send prn " + slice + " chunks random:1-700:7\n";
 
     ASSERT_EQ(RunScript("set expect continue\n" + send + send + "expect-jobs 3\nshow jobs\nshow job\nshow reader\n"
-                        "expect-job 1 equals slice:4:" + std::to_string(job.size()) + ":f.bin\n"
-                        "expect-jobs 5\nnote still here\nset expect stop\nexpect-jobs 9\nnote not reached\n"),
+                        "expect-job 1 equals " + slice + "\nexpect-jobs 5\nnote still here\nset expect stop\n"
+                        "expect-jobs 9\nnote not reached\n"),
               1);
 
     EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
@@ -273,193 +235,66 @@ TEST_F(Simulator, SliceAtSeededRandomSizesWithQueriesAndExpectationsThatGoOn) {
               std::string::npos);
     EXPECT_NE(output_.find("open job: none"), std::string::npos);
     EXPECT_NE(output_.find("print reader: polling, device plugged, 0 host bytes not read"), std::string::npos);
-    EXPECT_EQ(RunScript("send prn slice:4:99999:f.bin\n"), 1);  // past the file's end
-    EXPECT_EQ(RunScript("send prn uel chunks random:9-3:1\n"), 2);
 }
 
-TEST_F(Simulator, ScriptErrorsAreRefusedBeforeTheSessionStarts) {
-    EXPECT_EQ(RunScript("send prn uel\nsend prn hex:1b2\n"), 2);
-    EXPECT_NE(output_.find("session.sim:2"), std::string::npos);
-    EXPECT_EQ(RunScript("plug\nsendd prn uel\n"), 2);
-    EXPECT_NE(output_.find("unknown command 'sendd'"), std::string::npos);
-    EXPECT_FALSE(fs::exists(Out("journal.jsonl")));
-}
-
-TEST_F(Simulator, FilesOnTheCommandLineAreSentAsOneJobEach) {
+TEST_F(Simulator, CommandLineFilesAreOneJobEachAndWithoutThemTheSampleIsSent) {
     const std::string a = UelJob(PrintData(1000, 7));
     const std::string b = PrintData(1500, 8);  // no UEL: ended by silence
     WriteFile(Path("a.prn"), a);
     WriteFile(Path("b.prn"), b);
 
     ASSERT_EQ(Run({Path("a.prn"), Path("b.prn")}), 0);
-
     EXPECT_EQ(ReadFile(Out("job-001.prn")), a);
     EXPECT_EQ(ReadFile(Out("job-002.prn")), b);
     EXPECT_NE(output_.find("job-001.prn  = a.prn"), std::string::npos);
     EXPECT_NE(output_.find("job-002.prn  = b.prn"), std::string::npos);
-}
 
-TEST_F(Simulator, WithoutArgumentsTheBuiltInSampleIsOneUelFramedJob) {
     ASSERT_EQ(Run({}), 0);
-
     const std::string job = ReadFile(Out("job-001.prn"));
     ASSERT_GT(job.size(), 2 * kUel.size());
     EXPECT_EQ(job.substr(0, kUel.size()), kUel);
     EXPECT_EQ(job.substr(job.size() - kUel.size()), kUel);
     EXPECT_NE(job.find("@PJL"), std::string::npos);
-    EXPECT_EQ(Events("java", "job-end").size(), 1u);
     EXPECT_FALSE(fs::exists(Out("job-002.prn")));
 }
 
-TEST_F(Simulator, PulledCableEndsTheOpenJobAndAReplugReadsAgain) {
+// Data sent before the host configures the device is read afterwards; a pulled
+// cable ends the open job, and a re-plug lets the parked reader go on at once.
+TEST_F(Simulator, PlugAndUnplugAsTheHostDoes) {
+    const std::string early = UelJob(PrintData(4000, 11));
     const std::string partial = kUel + PrintData(800, 9);  // the closing UEL never comes
     const std::string next = UelJob(PrintData(500, 10));
+    WriteFile(Path("early.prn"), early);
     WriteFile(Path("partial.prn"), partial);
     WriteFile(Path("next.prn"), next);
 
-    ASSERT_EQ(RunScript("send prn file:partial.prn\nwait-idle\nexpect-jobs 0\nunplug\nexpect-jobs 1\n"
-                        "plug\nsend prn file:next.prn\nexpect-jobs 2\n"),
+    ASSERT_EQ(RunScript("send prn file:early.prn\nexpect-jobs 0\nplug\nexpect-jobs 1\nsend prn file:partial.prn\n"
+                        "wait-idle\nexpect-jobs 1\nunplug\nexpect-jobs 2\nplug\nsend prn file:next.prn\nexpect-jobs 3\n",
+                        {"--no-plug"}),
               0);
 
-    EXPECT_GT(IndexOf("java", "job-end"), IndexOf("host", "unplug"));
-    EXPECT_EQ(ReadFile(Out("job-001.prn")), partial);
-    EXPECT_EQ(ReadFile(Out("job-002.prn")), next);
-    // The parked reader looks at the flags once a second but goes on as soon as
-    // the host configures the device again: the next job does not wait for that.
-    const long plugged = std::stol(Events("host", "plug").back()["ms"]);
-    const long started = std::stol(Events("java", "job-start").back()["ms"]);
-    EXPECT_LT(started - plugged, 600);
-}
-
-TEST_F(Simulator, DataSentBeforeTheHostConfiguresTheDeviceIsReadAfterwards) {
-    const std::string job = UelJob(PrintData(4000, 11));
-    WriteFile(Path("early.prn"), job);
-
-    ASSERT_EQ(RunScript("send prn file:early.prn\nexpect-jobs 0\nplug\nexpect-jobs 1\n", {"--no-plug"}), 0);
-
-    EXPECT_LT(IndexOf("host", "plug"), IndexOf("java", "job-start"));
-    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
     auto steps = Events("sim", "startup");
     ASSERT_GE(steps.size(), 3u);
     EXPECT_EQ(steps[0]["step"], "creatPrnScanMsgQs");
     EXPECT_EQ(steps[1]["step"], "initDevice");
     EXPECT_EQ(steps[2]["step"], "readPrintMsg");
+    EXPECT_LT(IndexOf("host", "plug"), IndexOf("java", "job-start"));
+    const auto ends = Events("java", "job-end");
+    ASSERT_EQ(ends.size(), 3u);
+    EXPECT_GT(std::stol(ends[1]["seq"]), std::stol(Events("host", "unplug").at(0)["seq"]));
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), early);
+    EXPECT_EQ(ReadFile(Out("job-002.prn")), partial);
+    EXPECT_EQ(ReadFile(Out("job-003.prn")), next);
+    // The parked reader looks at the flags once a second but goes on as soon as
+    // the host configures the device again.
+    const long plugged = std::stol(Events("host", "plug").back()["ms"]);
+    const long started = std::stol(Events("java", "job-start").back()["ms"]);
+    EXPECT_LT(started - plugged, 600);
 }
 
-TEST_F(Simulator, JournalNumbersEveryLineAndMergesEveryJavaLine) {
-    WriteFile(Path("a.prn"), UelJob(PrintData(300, 12)) + UelJob(PrintData(200, 13)));
-
-    ASSERT_EQ(RunScript("send prn file:a.prn\nexpect-jobs 2\nread prn\n"), 0);
-
-    std::vector<Event> all = Journal();
-    ASSERT_FALSE(all.empty());
-    std::vector<std::string> merged;
-    for (size_t i = 0; i < all.size(); ++i) {
-        EXPECT_EQ(all[i]["seq"], std::to_string(i + 1));
-        EXPECT_TRUE(all[i].src == "host" || all[i].src == "java" || all[i].src == "sim") << all[i].line;
-        EXPECT_EQ(all[i].line.front(), '{');
-        EXPECT_EQ(all[i].line.back(), '}');
-        if (all[i].src == "java") merged.push_back(all[i].line.substr(all[i].line.find("\"event\"")));
-    }
-    std::vector<std::string> java;
-    std::istringstream in(ReadFile(Out("journal.jsonl")));
-    for (std::string line; std::getline(in, line);) java.push_back(line.substr(1));
-    EXPECT_EQ(merged, java);
-    EXPECT_EQ(Events("host", "read").at(0)["bytes"], "0");
-    EXPECT_EQ(all.back().event, "end");
-}
-
-TEST_F(Simulator, JobContentOrReadBackOtherThanExpectedFails) {
-    WriteFile(Path("job.prn"), UelJob("abc"));
-    WriteFile(Path("other.prn"), UelJob("abd"));
-
-    EXPECT_EQ(RunScript("send prn file:job.prn\nexpect-job 1 equals file:other.prn\n"), 1);
-    EXPECT_EQ(Events("sim", "expect").at(0)["ok"], "false");
-
-    EXPECT_EQ(RunScript("set timeout 300\nexpect-read prn hex:41\n"), 1);
-    auto reads = Events("host", "read");
-    ASSERT_EQ(reads.size(), 1u);
-    EXPECT_EQ(reads[0]["bytes"], "0");
-    EXPECT_EQ(Events("sim", "expect").at(0)["ok"], "false");
-
-    EXPECT_EQ(RunScript("send prn file:missing.prn\n"), 1);
-    EXPECT_NE(output_.find("cannot read"), std::string::npos);
-}
-
-// ---- firmware: the update manager on loopback -------------------------------------
-
-std::string ManagerFile(const std::string &out, int k, int type) {
-    char name[64];
-    std::snprintf(name, sizeof name, "/update-manager/image-%03d-type%d.bin", k, type);
-    return out + name;
-}
-
-#ifdef USBADAPTER_FW
-// The host tool packs the file; the host sends it as a driver would, each
-// header and each body a transfer of its own.
-TEST_F(Simulator, TwoImagesOfSixtyFourMebibytesReachTheManagerIntact) {
-    const std::string a = PrintData(40u << 20, 21), b = PrintData(24u << 20, 22);
-    WriteFile(Path("scan.img"), a);
-    WriteFile(Path("rootfs.img"), b);
-    const std::string cmd = std::string(USBADAPTER_FW) + " -q -o " + Path("fw.pkg") + " - E7=" + Path("scan.img") +
-                            " EC3=" + Path("rootfs.img");
-    ASSERT_EQ(std::system(cmd.c_str()), 0);
-    ASSERT_EQ(fs::file_size(Path("fw.pkg")), 160 + a.size() + b.size());
-
-    ASSERT_EQ(RunScript("fw-manager\nsend prn file:fw.pkg chunks 80," + std::to_string(a.size()) +
-                        ",80\nfw-expect-images 2 ends 1\nfw-expect-image 1 type 1 checksum ok sha256 " +
-                        sim::Sha256Hex(a) + "\nfw-expect-image 2 type 15 checksum ok sha256 " + sim::Sha256Hex(b) +
-                        "\nsend prn sample\nexpect-jobs 1\nexpect-job 1 equals sample\n"),
-              0);
-    EXPECT_EQ(ReadFile(ManagerFile(dir_ + "/out", 1, 1)), a);
-    EXPECT_EQ(ReadFile(ManagerFile(dir_ + "/out", 2, 15)), b);
-    const std::string log = ReadFile(Out("usbadapter.log"));
-    EXPECT_NE(log.find("[USBAdp] Firmware download success"), std::string::npos);
-    // The firmware file itself never reached the print service.
-    EXPECT_EQ(Events("java", "job-start").size(), 1u);
-}
-#endif
-
-TEST_F(Simulator, RejectedChecksumFailsTheDownloadAndPrintingGoesOn) {
-    const std::string job = UelJob(PrintData(5000, 23));
-    WriteFile(Path("job.prn"), job);
-
-    ASSERT_EQ(RunScript("fw-manager checksum-error\nfw-send E1 pattern:100K:4\nfw-expect-images 1 ends 0\n"
-                        "send prn file:job.prn\nexpect-jobs 1\n"),
-              0);
-    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
-    const std::string log = ReadFile(Out("usbadapter.log"));
-    EXPECT_NE(log.find("Invalid CheckSum Error"), std::string::npos);
-    EXPECT_NE(log.find("[USBAdp] Firmware download failed"), std::string::npos);
-}
-
-TEST_F(Simulator, PjlJobThatOnlyLooksLikeFirmwareIsPrintedByteExact) {
-    // FIRMWARE= without the blanks: a print job like any other.
-    const std::string job = kUel + "@PJL\r\n@PJL FIRMWARE=E7 \r\n" + PrintData(70000, 24) + kUel;
-    WriteFile(Path("job.prn"), job);
-
-    ASSERT_EQ(RunScript("fw-manager\nsend prn file:job.prn\nexpect-jobs 1\nfw-expect-images 0\n"), 0);
-    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
-}
-
-}  // namespace
-
-// The scan sample passes; an application transfer of another type or other
-// bytes than expected, or a capability reply the host did not get, fails.
-TEST_F(Simulator, ScanPacketsAndCapabilityRepliesAreCheckedByTypeAndBytes) {
+TEST_F(Simulator, ScanSampleSessionPasses) {
     ASSERT_EQ(Run({"--script", std::string(USBADAPTER_SOURCE_DIR) + "/tools/sim/samples/scan.sim"}), 0);
     EXPECT_EQ(Events("sim", "expect").size(), 15u);
-
-    const std::pair<const char *, const char *> failing[] = {
-        {"scan-start\nsend scan hex:1ba8280100\nexpect-app 1 ids\n", "is of type pcscan"},
-        {"scan-start\nsend scan hex:1ba8280100\nexpect-app 1 pcscan equals hex:1ba8280101\n", "holds 1ba8280100"},
-        {"scan-start\nset timeout 300\nsend scan hex:1b24f407000000000000\nexpect-capability scan size\n", "read back ,"},
-    };
-    for (const auto &[script, why] : failing) {
-        SCOPED_TRACE(script);
-        EXPECT_EQ(RunScript(script), 1);
-        EXPECT_NE(output_.find(why), std::string::npos);
-    }
 }
 
 TEST_F(Simulator, HibernationEndsTheOpenJobAndTheHostSeesTheStagedIdentity) {
@@ -485,3 +320,47 @@ TEST_F(Simulator, HibernationEndsTheOpenJobAndTheHostSeesTheStagedIdentity) {
     EXPECT_EQ(ReadFile(Out("job-001.prn")), partial);
     EXPECT_EQ(ReadFile(Out("job-002.prn")), next);
 }
+
+// ---- firmware: the update manager on loopback -------------------------------------
+
+#ifdef USBADAPTER_FW
+// The host tool packs the file; the host sends it as a driver would, each
+// header and each body a transfer of its own.
+TEST_F(Simulator, TwoImagesOfSixtyFourMebibytesReachTheManagerIntact) {
+    const std::string a = PrintData(40u << 20, 21), b = PrintData(24u << 20, 22);
+    WriteFile(Path("scan.img"), a);
+    WriteFile(Path("rootfs.img"), b);
+    const std::string cmd = std::string(USBADAPTER_FW) + " -q -o " + Path("fw.pkg") + " - E7=" + Path("scan.img") +
+                            " EC3=" + Path("rootfs.img");
+    ASSERT_EQ(std::system(cmd.c_str()), 0);
+    ASSERT_EQ(fs::file_size(Path("fw.pkg")), 160 + a.size() + b.size());
+
+    ASSERT_EQ(RunScript("fw-manager\nsend prn file:fw.pkg chunks 80," + std::to_string(a.size()) +
+                        ",80\nfw-expect-images 2 ends 1\nfw-expect-image 1 type 1 checksum ok sha256 " +
+                        sim::Sha256Hex(a) + "\nfw-expect-image 2 type 15 checksum ok sha256 " + sim::Sha256Hex(b) +
+                        "\nsend prn sample\nexpect-jobs 1\nexpect-job 1 equals sample\n"),
+              0);
+    EXPECT_EQ(ReadFile(Out("update-manager/image-001-type1.bin")), a);
+    EXPECT_EQ(ReadFile(Out("update-manager/image-002-type15.bin")), b);
+    EXPECT_NE(ReadFile(Out("usbadapter.log")).find("[USBAdp] Firmware download success"), std::string::npos);
+    // The firmware file itself never reached the print service.
+    EXPECT_EQ(Events("java", "job-start").size(), 1u);
+}
+#endif
+
+// After a download the manager refused, a PJL job that only looks like firmware
+// (FIRMWARE= without the blanks) is printed byte-exact.
+TEST_F(Simulator, RejectedChecksumFailsTheDownloadAndPrintingGoesOn) {
+    const std::string job = kUel + "@PJL\r\n@PJL FIRMWARE=E7 \r\n" + PrintData(70000, 24) + kUel;
+    WriteFile(Path("job.prn"), job);
+
+    ASSERT_EQ(RunScript("fw-manager checksum-error\nfw-send E1 pattern:100K:4\nfw-expect-images 1 ends 0\n"
+                        "send prn file:job.prn\nexpect-jobs 1\nfw-expect-images 1\n"),
+              0);
+    EXPECT_EQ(ReadFile(Out("job-001.prn")), job);
+    const std::string log = ReadFile(Out("usbadapter.log"));
+    EXPECT_NE(log.find("Invalid CheckSum Error"), std::string::npos);
+    EXPECT_NE(log.find("[USBAdp] Firmware download failed"), std::string::npos);
+}
+
+}  // namespace

@@ -4,7 +4,6 @@
 # with a raw queue on the print channel through CUPS's serial backend. Five
 # jobs queued at once arrive at the Java side as five jobs, byte-exact, in order.
 # usage: cups.sh USBADAPTER-SIM      (exit 77: cupsd cannot run here)
-set -u
 sim=$1
 skip() {
     echo "SKIP: $*"
@@ -16,38 +15,15 @@ command -v lp >/dev/null && command -v lpadmin >/dev/null || skip "no lp/lpadmin
 [ -e /usr/lib/cups/backend/serial ] || skip "no serial backend"
 [ "$(id -u)" -eq 0 ] || skip "cupsd runs its serial backend as root only: not root"
 
-dir=$(mktemp -d /tmp/usbadapter-e2e-cups-XXXXXX)
-chmod 755 "$dir"
-pid= cups=
-cleanup() {
-    [ -n "$cups" ] && kill -TERM "$cups" 2>/dev/null && wait "$cups" 2>/dev/null
-    [ -n "$pid" ] && kill -TERM "$pid" 2>/dev/null && wait "$pid" 2>/dev/null
-}
-fail() {
-    echo "FAIL: $*"
+name=cups
+cups=
+on_fail() {
     tail -n 30 "$dir/log/error_log" 2>/dev/null
-    cleanup
-    echo "(files kept in $dir)"
-    exit 1
+    [ -n "$cups" ] && kill -TERM "$cups" 2>/dev/null
 }
-# until_lines N PATTERN FILE: waits (bounded) for N lines matching PATTERN.
-until_lines() {
-    local i=0
-    until [ "$(grep -c "$2" "$3" 2>/dev/null)" -ge "$1" ]; do
-        i=$((i + 1))
-        [ $i -lt 1200 ] || fail "$(grep -c "$2" "$3" 2>/dev/null) lines of $2 in $3, expected $1"
-        sleep 0.05
-    done
-}
-
-"$sim" serve --out "$dir/out" --timeout 8000 >"$dir/sim.txt" 2>&1 &
-pid=$!
-i=0
-until [ -L "$dir/out/prn" ]; do
-    i=$((i + 1))
-    [ $i -lt 600 ] || fail "no print channel: $(cat "$dir/sim.txt")"
-    sleep 0.05
-done
+. "$(dirname "$0")/common.sh"
+chmod 755 "$dir"
+serve "$dir/out"
 
 mkdir -p "$dir/spool" "$dir/tmp" "$dir/cache" "$dir/state" "$dir/log" "$dir/etc/ppd"
 sock=$dir/cups.sock
@@ -87,7 +63,7 @@ i=0
 until [ -S "$sock" ] && lpstat -r 2>/dev/null | grep -q "is running"; do
     i=$((i + 1))
     if [ $i -ge 200 ] || ! kill -0 "$cups" 2>/dev/null; then
-        cups=
+        kill -TERM "$pid" 2>/dev/null
         skip "cupsd does not start here: $(cat "$dir/cupsd.txt"; tail -n 5 "$dir/log/error_log" 2>/dev/null)"
     fi
     sleep 0.05
@@ -99,8 +75,6 @@ lpadmin -p sim -E -v "$uri" >"$dir/lpadmin.txt" 2>&1 || fail "lpadmin: $(cat "$d
 # the backend's runs separate them.
 for i in 1 2 3 4 5; do
     head -c $((20000 + i * 3000)) /dev/urandom | tr -d '\033' >"$dir/job$i"
-done
-for i in 1 2 3 4 5; do
     lp -d sim -o raw -t "job$i" "$dir/job$i" >>"$dir/lp.txt" 2>&1 || fail "lp: $(cat "$dir/lp.txt")"
 done
 until_lines 5 '"event":"job-end"' "$dir/out/journal.jsonl"
@@ -115,6 +89,6 @@ for i in 1 2 3 4 5; do
 done
 [ "$(grep -c '"event":"job-end"' "$dir/out/journal.jsonl")" -eq 5 ] || fail "not 5 jobs at the Java side"
 grep -q "Unable to open serial port" "$dir/log/error_log" && fail "the backend found no device"
-cleanup
-rm -rf "$dir"
-echo "PASS"
+kill -TERM "$cups" && wait "$cups"
+stop "$dir/out"
+pass

@@ -3,52 +3,16 @@
 # a job in each, every job delivered byte-exact and in order; SIGTERM during a
 # job ends the session cleanly with the job and the end in the journal.
 # usage: serve.sh USBADAPTER-SIM
-set -u
 sim=$1
-dir=$(mktemp -d /tmp/usbadapter-e2e-serve-XXXXXX)
-pid=
-fail() {
-    echo "FAIL: $*"
-    [ -n "$pid" ] && kill -TERM "$pid" 2>/dev/null
-    echo "(files kept in $dir)"
-    exit 1
-}
-# start OUT: a serve session in the background, its print path at OUT/prn.
-start() {
-    "$sim" serve --out "$1" --timeout 8000 >"$1.txt" 2>&1 &
-    pid=$!
-    local i=0
-    until [ -L "$1/prn" ]; do
-        i=$((i + 1))
-        [ $i -lt 600 ] || fail "no print channel at $1/prn"
-        kill -0 "$pid" 2>/dev/null || fail "the simulator ended: $(cat "$1.txt")"
-        sleep 0.05
-    done
-}
-# until N PATTERN FILE: waits (bounded) for N lines matching PATTERN.
-until_lines() {
-    local i=0
-    until [ "$(grep -c "$2" "$3" 2>/dev/null)" -ge "$1" ]; do
-        i=$((i + 1))
-        [ $i -lt 600 ] || fail "$(grep -c "$2" "$3") lines of $2 in $3, expected $1"
-        sleep 0.05
-    done
-}
-stop() {
-    kill -TERM "$pid"
-    wait "$pid"
-    local status=$?
-    pid=
-    [ $status -eq 0 ] || fail "the simulator ended with status $status: $(cat "$1.txt")"
-}
+name=serve
+. "$(dirname "$0")/common.sh"
 
 # 100 jobs, one per open/close, back to back: UEL-framed, so each is a job of
 # its own even when a re-open comes before the simulator has seen the close.
-start "$dir/a"
+serve "$dir/a"
 for i in $(seq 1 100); do
-    printf '\033%%-12345X@PJL JOB NAME="%d"\r\n%0*d\033%%-12345X' "$i" "$i" "$i" >"$dir/a/prn" ||
-        fail "cycle $i: cannot write $dir/a/prn"
     printf '\033%%-12345X@PJL JOB NAME="%d"\r\n%0*d\033%%-12345X' "$i" "$i" "$i" >"$dir/want-$i.prn"
+    cat "$dir/want-$i.prn" >"$dir/a/prn" || fail "cycle $i: cannot write $dir/a/prn"
 done
 until_lines 100 '"event":"job-end"' "$dir/a/journal.jsonl"
 stop "$dir/a"
@@ -60,7 +24,7 @@ done
 
 # Unframed jobs (no ESC: no command selector inside) with a pause between
 # them: each close ends its job.
-start "$dir/b"
+serve "$dir/b"
 for i in 1 2 3; do
     head -c $((i * 70000)) /dev/urandom | tr -d '\033' >"$dir/raw-$i"
     cat "$dir/raw-$i" >"$dir/b/prn"
@@ -82,6 +46,4 @@ tail -n 1 "$dir/b/session.jsonl" | grep -q '"event":"end","status":"passed","exi
 grep -q '"event":"serve-stop","signal":15' "$dir/b/session.jsonl" || fail "no serve-stop in the journal"
 [ -n "$root" ] && [ ! -e "$root" ] || fail "the temporary root $root is still there"
 grep -q "^job 4: $(wc -c <"$dir/raw-4") bytes" "$dir/b.txt" || fail "no line for job 4: $(cat "$dir/b.txt")"
-
-rm -rf "$dir"
-echo "PASS"
+pass

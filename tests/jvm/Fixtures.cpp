@@ -16,7 +16,7 @@ struct Local {
     }
 };
 
-std::string StaticString(const char *name, const char *sig, jint arg) {
+std::string StaticString(const char *name, const char *sig, jint arg = 0) {
     JNIEnv *env = jvm::Env();
     Local s{env, jvm::CallStaticObject(kJournal, name, sig, arg)};
     return jvm::Text(env, static_cast<jstring>(s.obj));
@@ -32,11 +32,7 @@ std::string StaticBytes(const char *name, jint arg) {
 
 void Reset() { jvm::CallStaticVoid(kJournal, "reset", "()V"); }
 
-std::string Events() {
-    JNIEnv *env = jvm::Env();
-    Local s{env, jvm::CallStaticObject(kJournal, "events", "()Ljava/lang/String;")};
-    return jvm::Text(env, static_cast<jstring>(s.obj));
-}
+std::string Events() { return StaticString("events", "()Ljava/lang/String;"); }
 
 std::vector<std::string> EventLines() {
     std::vector<std::string> lines;
@@ -67,14 +63,11 @@ std::string JobBytes(int job) { return StaticBytes("jobBytes", job); }
 std::vector<int> JobChunkSizes(int job) {
     JNIEnv *env = jvm::Env();
     Local a{env, jvm::CallStaticObject(kJournal, "jobChunkSizes", "(I)[I", jint{job})};
-    std::vector<int> sizes;
-    if (!a.obj) return sizes;
+    if (!a.obj) return {};
     auto arr = static_cast<jintArray>(a.obj);
-    sizes.resize(static_cast<size_t>(env->GetArrayLength(arr)));
-    std::vector<jint> raw(sizes.size());
+    std::vector<jint> raw(static_cast<size_t>(env->GetArrayLength(arr)));
     env->GetIntArrayRegion(arr, 0, static_cast<jsize>(raw.size()), raw.data());
-    for (size_t i = 0; i < raw.size(); ++i) sizes[i] = raw[i];
-    return sizes;
+    return {raw.begin(), raw.end()};
 }
 
 long long JobByteCount(int job) { return jvm::CallStaticLong(kJournal, "jobByteCount", "(I)J", jint{job}); }

@@ -172,77 +172,42 @@ jbyteArray ByteArray(JNIEnv *env, const std::string &bytes) {
 
 std::string TakeException(JNIEnv *env) { return jvmhost::TakeException(env); }
 
+// The Call* entries: varargs taken here, the call made through Instance/Static.
+#define JVM_INSTANCE_CALL(R, Name, Jni, Failed)                                                         \
+    R Name(jobject obj, const char *name, const char *sig, ...) {                                       \
+        va_list ap;                                                                                     \
+        va_start(ap, sig);                                                                              \
+        R r = Instance(obj, name, sig, Failed, [&](JNIEnv *e, jmethodID m) { return e->Jni(obj, m, ap); }); \
+        va_end(ap);                                                                                     \
+        return r;                                                                                       \
+    }
+#define JVM_STATIC_CALL(R, Name, Jni, Failed)                                                                   \
+    R Name(const char *cls, const char *name, const char *sig, ...) {                                           \
+        va_list ap;                                                                                             \
+        va_start(ap, sig);                                                                                      \
+        R r = Static(cls, name, sig, Failed, [&](JNIEnv *e, jclass c, jmethodID m) { return e->Jni(c, m, ap); }); \
+        va_end(ap);                                                                                             \
+        return r;                                                                                               \
+    }
+JVM_INSTANCE_CALL(jint, CallInt, CallIntMethodV, jint{0})
+JVM_INSTANCE_CALL(jobject, CallObject, CallObjectMethodV, jobject{})
+JVM_STATIC_CALL(jint, CallStaticInt, CallStaticIntMethodV, jint{0})
+JVM_STATIC_CALL(jlong, CallStaticLong, CallStaticLongMethodV, jlong{0})
+JVM_STATIC_CALL(jboolean, CallStaticBoolean, CallStaticBooleanMethodV, jboolean{JNI_FALSE})
+JVM_STATIC_CALL(jobject, CallStaticObject, CallStaticObjectMethodV, jobject{})
+
 void CallVoid(jobject obj, const char *name, const char *sig, ...) {
     va_list ap;
     va_start(ap, sig);
-    Instance(obj, name, sig, 0, [&](JNIEnv *e, jmethodID m) {
-        e->CallVoidMethodV(obj, m, ap);
-        return 0;
-    });
+    Instance(obj, name, sig, 0, [&](JNIEnv *e, jmethodID m) { return e->CallVoidMethodV(obj, m, ap), 0; });
     va_end(ap);
-}
-
-jint CallInt(jobject obj, const char *name, const char *sig, ...) {
-    va_list ap;
-    va_start(ap, sig);
-    jint r = Instance(obj, name, sig, jint{0}, [&](JNIEnv *e, jmethodID m) { return e->CallIntMethodV(obj, m, ap); });
-    va_end(ap);
-    return r;
-}
-
-jobject CallObject(jobject obj, const char *name, const char *sig, ...) {
-    va_list ap;
-    va_start(ap, sig);
-    jobject r = Instance(obj, name, sig, jobject{},
-                         [&](JNIEnv *e, jmethodID m) { return e->CallObjectMethodV(obj, m, ap); });
-    va_end(ap);
-    return r;
 }
 
 void CallStaticVoid(const char *cls, const char *name, const char *sig, ...) {
     va_list ap;
     va_start(ap, sig);
-    Static(cls, name, sig, 0, [&](JNIEnv *e, jclass c, jmethodID m) {
-        e->CallStaticVoidMethodV(c, m, ap);
-        return 0;
-    });
+    Static(cls, name, sig, 0, [&](JNIEnv *e, jclass c, jmethodID m) { return e->CallStaticVoidMethodV(c, m, ap), 0; });
     va_end(ap);
-}
-
-jint CallStaticInt(const char *cls, const char *name, const char *sig, ...) {
-    va_list ap;
-    va_start(ap, sig);
-    jint r = Static(cls, name, sig, jint{0},
-                    [&](JNIEnv *e, jclass c, jmethodID m) { return e->CallStaticIntMethodV(c, m, ap); });
-    va_end(ap);
-    return r;
-}
-
-jlong CallStaticLong(const char *cls, const char *name, const char *sig, ...) {
-    va_list ap;
-    va_start(ap, sig);
-    jlong r = Static(cls, name, sig, jlong{0},
-                     [&](JNIEnv *e, jclass c, jmethodID m) { return e->CallStaticLongMethodV(c, m, ap); });
-    va_end(ap);
-    return r;
-}
-
-jboolean CallStaticBoolean(const char *cls, const char *name, const char *sig, ...) {
-    va_list ap;
-    va_start(ap, sig);
-    jboolean r = Static(cls, name, sig, jboolean{JNI_FALSE},
-                        [&](JNIEnv *e, jclass c, jmethodID m) { return e->CallStaticBooleanMethodV(c, m, ap); });
-    va_end(ap);
-    return r;
-}
-
-jobject CallStaticObject(const char *cls, const char *name, const char *sig, ...) {
-    va_list ap;
-    va_start(ap, sig);
-    jobject r = Static(cls, name, sig, jobject{},
-                       [&](JNIEnv *e, jclass c, jmethodID m) { return e->CallStaticObjectMethodV(c, m, ap); });
-    va_end(ap);
-    return r;
 }
 
 void StartDetached(std::function<void(JNIEnv *)> body, const char *threadName) {
@@ -262,7 +227,5 @@ void RunOnThread(std::function<void(JNIEnv *)> body, const char *threadName) {
         jvmhost::Vm()->DetachCurrentThread();
     }).join();
 }
-
-std::vector<std::string> Options() { return jvmhost::JvmOptions(Config()); }
 
 }  // namespace jvm

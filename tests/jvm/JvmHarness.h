@@ -14,7 +14,6 @@
 
 #include <functional>
 #include <string>
-#include <vector>
 
 namespace jvm {
 
@@ -24,10 +23,6 @@ inline constexpr const char *kPrintAndScanService =
 inline constexpr const char *kKivoropnlAndDacService =
     "com/tarnwel/vbk/common/qz/services/usbadapter/USBAdapterKivoropnlAndDACJNIService";
 inline constexpr const char *kPluginAdapter = "com/tarnwel/vbk/ca/plugin/usbadapter/USBAdapter";
-inline constexpr const char *kPrintDaemon = "com/tarnwel/vbk/ca/plugin/usbadapter/print/USBPrintDaemon";
-inline constexpr const char *kFileStreamHandler =
-    "com/tarnwel/vbk/ca/plugin/usbadapter/print/USBPrintFileStreamHandler";
-inline constexpr const char *kMaaService = "com/tarnwel/vbk/ca/plugin/usbadapter/print/USBMaaService";
 inline constexpr const char *kReferenceService =
     "com/tarnwel/vbk/ca/plugin/usbadapter/print/ReferencePrintService";
 
@@ -79,8 +74,5 @@ void StartDetached(std::function<void(JNIEnv *)> body, const char *threadName);
 // Runs `body` on a new attached thread and waits for it: for entries that
 // the Java service calls from a thread other than the reader's.
 void RunOnThread(std::function<void(JNIEnv *)> body, const char *threadName);
-
-// The options the JVM is (or will be) created with, for diagnostics.
-std::vector<std::string> Options();
 
 }  // namespace jvm

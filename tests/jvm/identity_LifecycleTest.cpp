@@ -55,14 +55,6 @@ TEST_F(Lifecycle, CloseEndsTheOpenJobAndReopenResumesWithTheNextJobWhole) {
     EXPECT_EQ(fixtures::JobCount(), 2);
 }
 
-TEST_F(Lifecycle, CloseBeforeTheReaderStartedDoesNotWait) {
-    StartReader(fixtures::kRecordingDaemon, false);
-    jvm::CallVoid(daemon_, "initDevice", "()V");
-    ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp]Exited Initialization(), fdPrn:"); }));
-    EXPECT_EQ(Hibernate(daemon_), 1);
-    EXPECT_EQ(vdev::OpenCount(vdev::kPrn), 0);
-}
-
 TEST_F(Lifecycle, ReopenWithTheCableOutLeavesTheDeviceUnconfigured) {
     StartReader();
     EXPECT_EQ(OpenCheck(), 1);

@@ -137,24 +137,6 @@ TEST_F(ScanChannel, WhenJavaFailsTheHostGetsNoReplyAndTheNextRequestWorks) {
     EXPECT_EQ(fixtures::Calls("getCapXmlSize"), 2);
 }
 
-TEST_F(ScanChannel, ClosedChannelIsLeftAloneUntilJavaReopensIt) {
-    StartBoth();
-    if (HasFatalFailure()) return;
-    EXPECT_EQ(jvm::CallInt(daemon_, "USBScanDrvClose", "()I"), 1);
-    EXPECT_EQ(vdev::OpenCount(vdev::kScan), 0);
-    vdev::HostWrite(vdev::kScan, kPcScan);
-    ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp Scan] g_IsScanCanClose: 1, IsConfigured: 1"); }));
-    EXPECT_EQ(vdev::PendingHostBytes(vdev::kScan), kPcScan.size());
-    EXPECT_EQ(jvm::CallInt(daemon_, "USBScanDrvOpen", "()I"), 1);
-    ASSERT_TRUE(WaitUntil([] { return fixtures::AppCount() == 1 && fixtures::AppClosed(0); }));
-    EXPECT_EQ(fixtures::AppBytes(0), kPcScan);
-    EXPECT_EQ(fixtures::AppThread(0), "scan-reader");
-}
-
-}  // namespace
-
-namespace {
-
 TEST_F(ScanChannel, ReadScanMsgReturnsToJavaWhenTheScanNodeIsMissing) {
     vdev::SetPresent(vdev::kScan, false);
     JNIEnv *env = jvm::Env();

@@ -39,24 +39,23 @@ protected:
     TempRoot root;
 };
 
-TEST_F(BridgeQueues, FirstStartWritesPlaceholderReportLine) {
-    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("MX-4070N"), 1);
-    EXPECT_EQ(ReadFile(root / REPORT_FILE), std::string("0000-00000000000\tMX-4070N"));
-}
-
-TEST_F(BridgeQueues, ExistingReportFileIsLeftUntouched) {
-    const std::string existing = "1234-56789012345\tOLD-MODEL\n";
-    std::ofstream(root / REPORT_FILE, std::ios::binary) << existing;
-    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("NEW-MODEL"), 1);
-    EXPECT_EQ(ReadFile(root / REPORT_FILE), existing);
-}
-
-TEST_F(BridgeQueues, OverlongModelNameIsCutToTheReportBuffer) {
+TEST_F(BridgeQueues, ReportFileIsWrittenOnceWithThePlaceholderSerialAndTheModel) {
     const std::string longName(200, 'M');
-    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs(longName.c_str()), 1);
-    std::string line = ReadFile(root / REPORT_FILE);
-    EXPECT_EQ(line.size(), static_cast<size_t>(USB_SERIAL_SIZE - 1));
-    EXPECT_EQ(line.substr(0, 17), "0000-00000000000\t");
+    const std::string cut = "0000-00000000000\t" + longName.substr(0, USB_SERIAL_SIZE - 18);  // the report buffer
+    const struct {
+        const char *existing;  // null: no report file yet
+        const char *model, *want;
+    } cases[] = {
+        {nullptr, "MX-4070N", "0000-00000000000\tMX-4070N"},
+        {"1234-56789012345\tOLD-MODEL\n", "NEW-MODEL", "1234-56789012345\tOLD-MODEL\n"},
+        {nullptr, longName.c_str(), cut.c_str()},
+    };
+    for (const auto &c : cases) {
+        std::filesystem::remove(root / REPORT_FILE);
+        if (c.existing) std::ofstream(root / REPORT_FILE, std::ios::binary) << c.existing;
+        ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs(c.model), 1);
+        EXPECT_EQ(ReadFile(root / REPORT_FILE), c.want) << c.model;
+    }
 }
 
 TEST_F(BridgeQueues, QueuesUseTheKeyFileWithProjectIdsFiveAndSix) {
@@ -79,22 +78,31 @@ TEST_F(BridgeQueues, ExistingQueuesAreReusedWithWhatTheyHold) {
     EXPECT_EQ(TakeQueueStatus(globalPrnMsgQ), MFP_DEV_INIT);
 }
 
-TEST_F(BridgeQueues, MissingKeyFileDirectoryFailsCleanly) {
-    std::filesystem::remove_all(root / "/halvard/spool");
-    EXPECT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 0);
+TEST_F(BridgeQueues, MissingDirectoryFailsCleanlyAndMakesNoQueue) {
     const std::string keyFile = root / FTOK_FILE;
-    EXPECT_TRUE(LoggerHost_Contains("[USBAdp][USB]Error Cannot open file for ftok key: " + keyFile + ", errno: 2\n"));
-    EXPECT_TRUE(LoggerHost_Contains("No tmp file /halvard/spool, errno: 2\n"));
-    EXPECT_EQ(globalPrnMsgQ.load(), -1);
-    EXPECT_EQ(globalScanMsgQ.load(), -1);
-}
-
-TEST_F(BridgeQueues, UnwritableReportDirectoryFailsBeforeAnyQueue) {
-    std::filesystem::remove_all(root / "/halvard/sys");
-    EXPECT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 0);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp][USB]Error in opening file/File doesn't exist.\n"), 1);
-    EXPECT_FALSE(LoggerHost_Contains("Creating message queues"));
-    EXPECT_EQ(globalPrnMsgQ.load(), -1);
+    const std::string noKey = "[USBAdp][USB]Error Cannot open file for ftok key: " + keyFile + ", errno: 2\n";
+    const struct {
+        const char *removed;
+        const char *line;  // logged once
+        bool queuesTried;
+    } cases[] = {
+        // The report file comes first: no queue is even tried.
+        {"/halvard/sys", "[USBAdp][USB]Error in opening file/File doesn't exist.\n", false},
+        {"/halvard/spool", noKey.c_str(), true},
+        {"/halvard/spool", "No tmp file /halvard/spool, errno: 2\n", true},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(c.line);
+        LoggerHost_StartCapture();
+        std::filesystem::remove_all(root / c.removed);
+        EXPECT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 0);
+        EXPECT_EQ(LoggerHost_Count(c.line), 1);
+        EXPECT_EQ(LoggerHost_Contains("Creating message queues"), c.queuesTried);
+        EXPECT_FALSE(LoggerHost_Contains("message queue id"));
+        EXPECT_EQ(globalPrnMsgQ.load(), -1);
+        EXPECT_EQ(globalScanMsgQ.load(), -1);
+        std::filesystem::create_directories(root / "/halvard/sys/statusinfo");
+    }
 }
 
 TEST_F(BridgeQueues, InitDevicePostsOneInitMessageOfEightBytes) {

@@ -58,28 +58,46 @@ protected:
     int fd = -1;
 };
 
-TEST_F(SignalHandler, ResetIsRoutedByWhomItIsFor) {
-    Deliver(MFP_DEV_RESET, eMfp_Notif_Prn);
-    EXPECT_EQ(Print(), MFP_DEV_RESET);
-    EXPECT_EQ(Scan(), std::nullopt);
-
-    Deliver(MFP_DEV_RESET, eMfp_Notif_Scan);
-    EXPECT_EQ(Print(), std::nullopt);
-    EXPECT_EQ(Scan(), MFP_DEV_RESET);
-
-    Deliver(MFP_DEV_RESET, eMfp_Notif_Both);
-    EXPECT_EQ(Print(), MFP_DEV_RESET);
-    EXPECT_EQ(Scan(), MFP_DEV_RESET);
-
-    EXPECT_EQ(IsConfigured.load(), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread]Requested MFP_DEV_RESET message received!\n"), 3);
-}
-
-TEST_F(SignalHandler, UnknownRecipientStillProcessesTheCodeAndGoesToScan) {
-    Deliver(MFP_DEV_RESET, 7);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Request not supported!/Unwanted signal\n"), 1);
-    EXPECT_EQ(Print(), std::nullopt);
-    EXPECT_EQ(Scan(), MFP_DEV_RESET);
+// Where each notification goes, by its code and whom the driver says it is for.
+TEST_F(SignalHandler, NotificationsAreRoutedByCodeAndRecipient) {
+    constexpr int kNone = -1;
+    const struct {
+        U8 code;
+        S32 forWhom;
+        int print, scan;   // status posted on each queue, or kNone
+        const char *line;  // logged once
+        U8 configuredBefore = 0, configuredAfter = 1;
+    } cases[] = {
+        {MFP_DEV_RESET, eMfp_Notif_Prn, MFP_DEV_RESET, kNone,
+         "[USBAdp] [print thread]Requested MFP_DEV_RESET message received!\n"},
+        {MFP_DEV_RESET, eMfp_Notif_Scan, kNone, MFP_DEV_RESET, nullptr},
+        {MFP_DEV_RESET, eMfp_Notif_Both, MFP_DEV_RESET, MFP_DEV_RESET, nullptr},
+        // An unknown recipient still has its code processed, for scan.
+        {MFP_DEV_RESET, 7, kNone, MFP_DEV_RESET, "[USBAdp] [print thread] Request not supported!/Unwanted signal\n"},
+        {SCAN_COMMAND, eMfp_Notif_Scan, kNone, SCAN_COMMAND, nullptr, 0, 0},
+        {SCAN_COMMAND, eMfp_Notif_Prn, kNone, kNone,
+         "[USBAdp][print thread] This signal is meant for scan but is received in wrong mode.\n.", 0, 0},
+        {SCAN_COMMAND, eMfp_Notif_Both, kNone, kNone,
+         "[USBAdp][print thread] This signal is meant for scan but is received in wrong mode.\n.", 0, 0},
+        {MFP_VENDOR_REQUEST, eMfp_Notif_Prn, kNone, kNone, "[USBAdp] [print thread] Request not supported 9\n", 0, 0},
+        {MFP_DEV_DISCONNECT, eMfp_Notif_Both, kNone, kNone,
+         "[USBAdp] [print thread] Requested MFP_DEV_DISCONNECT message received!\n", 1, 0},
+    };
+    for (const auto &c : cases) {
+        SCOPED_TRACE(::testing::Message() << int{c.code} << " for " << c.forWhom);
+        LoggerHost_StartCapture();
+        IsConfigured = c.configuredBefore;
+        Deliver(c.code, c.forWhom);
+        EXPECT_EQ(Print().value_or(kNone), c.print);
+        EXPECT_EQ(Scan().value_or(kNone), c.scan);
+        if (c.line) {
+            EXPECT_EQ(LoggerHost_Count(c.line), 1);
+        }
+        const bool pulled = c.code == MFP_DEV_DISCONNECT;
+        EXPECT_EQ(IsConfigured.load(), c.configuredAfter);
+        EXPECT_EQ(IsDisconnected.load(), pulled ? 1 : 0);
+        EXPECT_EQ(MAA_IsUSBDisconnected(), pulled ? 1 : 0);
+    }
 }
 
 TEST_F(SignalHandler, OnlyTheFirstConfigurationIsForwarded) {
@@ -98,52 +116,23 @@ TEST_F(SignalHandler, OnlyTheFirstConfigurationIsForwarded) {
     EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] bootUpFlag == 1\n"), 1);
 }
 
-TEST_F(SignalHandler, ConfigurationThatCouldNotBePostedIsForwardedAgain) {
+// A failed send keeps the request flags and does not count as the first
+// configuration: once the queue is back, the next configuration is forwarded.
+TEST_F(SignalHandler, FailedSendKeepsTheRequestFlagsAndTheConfigurationComesAgain) {
+    const std::string failed = "[USBAdp] [print thread] Can't send message through Prn_MsgQ message queue.\n";
     RemoveQueue(globalPrnMsgQ);
     Deliver(MFP_DEV_CONFIGURED, eMfp_Notif_Prn);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Can't send message through Prn_MsgQ message queue.\n"), 1);
+    EXPECT_EQ(LoggerHost_Count(failed), 1);
     EXPECT_EQ(bootUpFlag.load(), 0);
+    // The print flag survived, so a scan-only reset goes to the missing print queue again.
+    Deliver(MFP_DEV_RESET, eMfp_Notif_Scan);
+    EXPECT_EQ(Scan(), std::nullopt);
+    EXPECT_EQ(LoggerHost_Count(failed), 2);
 
-    // The queue is back (the service re-created it); the host configures again.
     ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
     Deliver(MFP_DEV_CONFIGURED, eMfp_Notif_Prn);
     EXPECT_EQ(Print(), MFP_DEV_CONFIGURED);
     EXPECT_EQ(bootUpFlag.load(), 1);
-}
-
-TEST_F(SignalHandler, DisconnectPostsNothingAndFlipsTheFlags) {
-    IsConfigured = 1;
-    Deliver(MFP_DEV_DISCONNECT, eMfp_Notif_Both);
-    EXPECT_EQ(Print(), std::nullopt);
-    EXPECT_EQ(Scan(), std::nullopt);
-    EXPECT_EQ(IsConfigured.load(), 0);
-    EXPECT_EQ(IsDisconnected.load(), 1);
-    EXPECT_EQ(MAA_IsUSBDisconnected(), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Requested MFP_DEV_DISCONNECT message received!\n"), 1);
-}
-
-TEST_F(SignalHandler, ScanCommandGoesToTheScanQueueOnlyWhenMeantForScan) {
-    Deliver(SCAN_COMMAND, eMfp_Notif_Scan);
-    EXPECT_EQ(Scan(), SCAN_COMMAND);
-    EXPECT_EQ(Print(), std::nullopt);
-
-    for (S32 whom : {S32{eMfp_Notif_Prn}, S32{eMfp_Notif_Both}}) {
-        LoggerHost_StartCapture();
-        Deliver(SCAN_COMMAND, whom);
-        EXPECT_EQ(Scan(), std::nullopt);
-        EXPECT_EQ(Print(), std::nullopt);
-        EXPECT_EQ(LoggerHost_Count(
-                      "[USBAdp][print thread] This signal is meant for scan but is received in wrong mode.\n."),
-                  1);
-    }
-}
-
-TEST_F(SignalHandler, UnhandledCodesAreLoggedAndNotPosted) {
-    Deliver(MFP_VENDOR_REQUEST, eMfp_Notif_Prn);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Request not supported 9\n"), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Value of status: 9\n"), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Value of forWhom: 1\n"), 1);
-    EXPECT_EQ(Print(), std::nullopt);
 }
 
 TEST_F(SignalHandler, FailedNotificationReadIsLoggedAndIgnored) {
@@ -154,17 +143,6 @@ TEST_F(SignalHandler, FailedNotificationReadIsLoggedAndIgnored) {
     EXPECT_EQ(IsConfigured.load(), 1);
     EXPECT_EQ(Print(), std::nullopt);
     EXPECT_EQ(Scan(), std::nullopt);
-}
-
-TEST_F(SignalHandler, FailedSendIsLoggedAndKeepsTheRequestFlags) {
-    RemoveQueue(globalPrnMsgQ);
-    Deliver(MFP_DEV_RESET, eMfp_Notif_Prn);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Can't send message through Prn_MsgQ message queue.\n"), 1);
-    // The print request flag survived the failure, so the next scan-only reset
-    // is routed to the (now missing) print queue again rather than to scan.
-    Deliver(MFP_DEV_RESET, eMfp_Notif_Scan);
-    EXPECT_EQ(Scan(), std::nullopt);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [print thread] Can't send message through Prn_MsgQ message queue.\n"), 2);
 }
 
 TEST_F(SignalHandler, RealSignalFromTheDriverReachesTheQueue) {

@@ -56,13 +56,6 @@ protected:
 
 // ---- Device ID -------------------------------------------------------------------
 
-TEST_F(Identity, DeviceIdOfAModelInNeitherGroupIsExact) {
-    SetDeviceIDString();
-    EXPECT_EQ(Str(aub_dev1284_str),
-              "MFG:MFR;CMD:PCL5E,PCL6,POSTSCRIPT,FAX,FWV,QMDS,EXT,SBC;MDL:MODEL;CLS:CLASS;MODE:QML7,SCN;STATUS:IDLE;");
-    EXPECT_TRUE(LoggerHost_Contains("[USBAdp] aub_dev1284_str, sizeof: 200::length: 101"));
-}
-
 TEST_F(Identity, ModelGroupsSwitchCommandSetsAndCompatibleIds) {
     struct Case {
         const char *model;
@@ -78,12 +71,15 @@ TEST_F(Identity, ModelGroupsSwitchCommandSetsAndCompatibleIds) {
         {"tw-c5050", "PCL5E,PCL6,POSTSCRIPT,PDF,TIFF,JPEG,FAX,FWV,QMDS,EXT,SBC", "CID:NV_PCL6_Color;"},
     };
     for (const Case &c : cases) {
-        Put(aub_pd_string, c.model);
-        SetDeviceIDString_reOpen();
-        EXPECT_EQ(Str(aub_dev1284_str), std::string("MFG:MFR;CMD:") + c.cmd + ";MDL:" + c.model +
-                                            ";CLS:CLASS;MODE:QML7,SCN;" + c.cid + "STATUS:IDLE;")
-            << c.model;
+        for (void (*build)() : {SetDeviceIDString, SetDeviceIDString_reOpen}) {
+            Put(aub_pd_string, c.model);
+            build();
+            EXPECT_EQ(Str(aub_dev1284_str), std::string("MFG:MFR;CMD:") + c.cmd + ";MDL:" + c.model +
+                                                ";CLS:CLASS;MODE:QML7,SCN;" + c.cid + "STATUS:IDLE;")
+                << c.model;
+        }
     }
+    EXPECT_TRUE(LoggerHost_Contains("[USBAdp] aub_dev1284_str, sizeof: 200::length: 101"));
 }
 
 TEST_F(Identity, LongestJavaStringsAreCutToTheDeviceIdBuffer) {
@@ -132,18 +128,14 @@ TEST_F(Identity, DescriptorRequestCarriesIdsStringsAndSizesWithTheirNul) {
     }
 }
 
-TEST_F(Identity, ProductTableHas21RowsOfFiveToThirteenCharacters) {
+// Every row of the product table is reachable: no earlier prefix hides it.
+TEST_F(Identity, EveryProductTableRowIsReachable) {
     U32 n = 0;
     const TProductIdRow *rows = ProductConfig_Table(&n);
-    ASSERT_EQ(n, 21u);
-    for (U32 i = 0; i < n; ++i) {
-        size_t len = std::strlen(rows[i].prefix);
-        EXPECT_GE(len, 5u) << rows[i].prefix;
-        EXPECT_LE(len, 13u) << rows[i].prefix;
-        // Every row is reachable: no earlier prefix hides it.
+    ASSERT_GT(n, 0u);
+    for (U32 i = 0; i < n; ++i)
         EXPECT_EQ(ProductConfig_ProductId(reinterpret_cast<const U8 *>(rows[i].prefix)), rows[i].pid)
             << rows[i].prefix;
-    }
 }
 
 TEST_F(Identity, MaaVariantUsesTheDefaultProductIdAndDoesNotConnect) {
@@ -233,16 +225,13 @@ TEST_F(Identity, ReportFileTakesFourCharactersAndTheSeriesName) {
 
 // ---- close and re-open -------------------------------------------------------------
 
-TEST_F(Identity, CloseBeforeTheReaderStartedDoesNotWait) {
-    startreading_enter = 0;
-    IsCanClose = 0;
+TEST_F(Identity, CloseForgetsTheNodeEvenWhenItFails) {
+    // Before the reader started: no wait.
     EXPECT_EQ(USBAdapter_IF_PrintClose(), 1);
     EXPECT_EQ(fdPrn.load(), 0);
     EXPECT_EQ(vdev::OpenCount(vdev::kPrn), 0);
     EXPECT_EQ(hibernation_flag.load(), 1);
-}
 
-TEST_F(Identity, FailingCloseStillForgetsTheNode) {
     int real = fdPrn.exchange(::open("/dev/null", O_RDONLY));
     ::close(fdPrn.load());  // now a closed descriptor: close fails
     EXPECT_EQ(USBAdapter_IF_PrintClose(), 0);
@@ -282,12 +271,11 @@ TEST_F(Identity, ReopenSetsTheNodeUpAgainAndResumes) {
     EXPECT_TRUE(LoggerHost_Contains("[USBAdp] IsDisconnected signal is set"));
 }
 
-TEST_F(Identity, ReopenThatCannotOpenTheNodeAnswersZero) {
+TEST_F(Identity, ReopenThatCannotSetTheNodeUpAnswersZero) {
     ASSERT_EQ(USBAdapter_IF_PrintClose(), 1);
     vdev::SetPresent(vdev::kPrn, false);
     EXPECT_EQ(USBAdapter_IF_PrintInit(), 0);
     EXPECT_EQ(fdPrn.load(), 0);
-    EXPECT_EQ(hibernation_flag.load(), 1);
     vdev::SetPresent(vdev::kPrn, true);
     vdev::FailIoctl(vdev::kPrn, IOCNR_SET_DESC_REQ, EIO);
     EXPECT_EQ(USBAdapter_IF_PrintInit(), 0);

@@ -1,0 +1,58 @@
+# Start-up shared by the e2e scripts (sourced by bash): a work directory kept on
+# failure, bounded waits, and the simulator in the background.
+# Before sourcing: name=WORD (part of the directory name); optional hook
+# on_fail (called before a failure exits).
+set -u
+dir=$(mktemp -d "/tmp/usbadapter-e2e-$name-XXXXXX")
+pid=
+fail() {
+    echo "FAIL: $*"
+    declare -F on_fail >/dev/null && on_fail
+    [ -n "$pid" ] && kill -TERM "$pid" 2>/dev/null
+    echo "(files kept in $dir)"
+    exit 1
+}
+# until_lines N PATTERN FILE: waits (bounded) for N lines matching PATTERN.
+until_lines() {
+    local i=0
+    until [ "$(grep -c "$2" "$3" 2>/dev/null)" -ge "$1" ]; do
+        i=$((i + 1))
+        [ $i -lt 1200 ] || fail "$(grep -c "$2" "$3" 2>/dev/null) lines of $2 in $3, expected $1"
+        sleep 0.05
+    done
+}
+# until_link PATH WHAT: waits (bounded) for the simulator's link PATH while it runs.
+until_link() {
+    local i=0
+    until [ -L "$1" ]; do
+        i=$((i + 1))
+        [ $i -lt 600 ] || fail "no $2 at $1"
+        kill -0 "$pid" 2>/dev/null || fail "the simulator ended before making $2"
+        sleep 0.05
+    done
+}
+# sim_bg OUT ARGS...: the simulator in the background (pid), output in OUT.txt.
+sim_bg() {
+    local out=$1
+    shift
+    "$sim" "$@" --out "$out" --timeout 8000 >"$out.txt" 2>&1 &
+    pid=$!
+}
+# serve OUT: a serve session in the background, its print path at OUT/prn.
+serve() {
+    sim_bg "$1" serve
+    until_link "$1/prn" "print channel"
+}
+# stop OUT: SIGTERM to the session; it must end with status 0.
+stop() {
+    kill -TERM "$pid"
+    wait "$pid"
+    local status=$?
+    pid=
+    [ $status -eq 0 ] || fail "the simulator ended with status $status: $(cat "$1.txt")"
+}
+# pass: removes the work directory.
+pass() {
+    rm -rf "$dir"
+    echo "PASS"
+}
