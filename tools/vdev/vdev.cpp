@@ -281,7 +281,9 @@ bool EnsurePair(NodeState &n) {
 
 void PushTransfer(NodeState &n, std::vector<uint8_t> bytes) {
     n.rx.push_back(std::move(bytes));
-    if (!n.marker && EnsurePair(n)) {
+    // A pair made here already carries the marker for what rx holds: a second
+    // one would leave the node readable after the last byte was taken.
+    if (!n.marker && EnsurePair(n) && !n.marker) {
         char m = 'm';
         n.marker = send(n.hostEnd.get(), &m, 1, MSG_DONTWAIT | MSG_NOSIGNAL) == 1;
     }

@@ -294,8 +294,8 @@ TEST_F(Vdev, ResetReleasesBlockedReadersKillsHeldDescriptorsAndForgetsEverything
     EXPECT_EQ(vdev::Owner(vdev::kPrn), 0);
     EXPECT_EQ(U32{vdev::Timeouts().ul_prn_read_to}, U32{vdev::kInitialTimeouts.ul_prn_read_to});
     EXPECT_TRUE(Open(vdev::kScan)) << "all nodes are present again";
+    vdev::HostWrite(vdev::kPrn, "after");  // queued before any open: one readiness marker only
     UniqueFd fresh = Open(vdev::kPrn);
-    vdev::HostWrite(vdev::kPrn, "after");
     char c;
     EXPECT_EQ(read(fd.get(), &c, 1), 0) << "a dead descriptor takes no new transfer";
     EXPECT_EQ(write(fd.get(), "x", 1), -1);
