@@ -389,8 +389,11 @@ S32 MAA_Hook(U32 ulDrvHandleGot, U8 *command) {
 // ---- start-up --------------------------------------------------------------------
 
 void MAA_Initialize(void) {
-    stDataHeap = {};
-    stCmdHeap = {};
+    // A second start (in-process restart) must not strand what a session held.
+    for (MAAHeapHandle *h : {&stDataHeap, &stCmdHeap}) {
+        MAA_HeapFree(h->ulHeapPtr, 0);
+        *h = {};
+    }
     ulReadCount = 0;
     int q = ::msgget(kMAAQueueKey, IPC_CREAT | 0666);
     if (q < 0) {
