@@ -250,6 +250,10 @@ bool FwExpectImage(Session &s, const Args &a, std::string *error) {
     return Expect(s, line, failure.empty(), failure, error);
 }
 
+void FwStopManager() {
+    if (ManagerRunning()) Manager().Stop();
+}
+
 std::vector<FwImageSeen> FwImages() {
     std::vector<FwImageSeen> seen;
     if (!ManagerRunning()) return seen;

@@ -28,5 +28,8 @@ struct FwImageSeen {
     std::string file;
 };
 std::vector<FwImageSeen> FwImages();
+// Stops the update manager's threads (the process ends with _exit, which
+// runs no destructors).
+void FwStopManager();
 
 }  // namespace sim

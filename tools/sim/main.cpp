@@ -20,6 +20,7 @@
 #include <vector>
 
 #include "Data.h"
+#include "FirmwareCommands.h"
 #include "Host.h"
 #include "Jvm.h"
 #include "Script.h"
@@ -322,6 +323,7 @@ void Summary(const Options &o, bool passed) {
     s.Sim(sim::JsonLine("end").Str("status", status == kExitPassed ? "passed" : "failed").Num("exit", status)
               .Num("jobs", s.EndedJobs()).Num("open-jobs", s.OpenJobs()).Num("apps", s.EndedApps()));
     if (summary) Summary(o, status == kExitPassed);
+    sim::FwStopManager();
     if (!gRoot.empty()) {
         RemoveQueues();
         std::error_code ec;
