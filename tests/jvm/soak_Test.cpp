@@ -200,9 +200,13 @@ protected:
     void Hibernate() {
         ++hibernations_;
         ASSERT_EQ(CallService("USBPrintDrvClose", true), 1);
+        // Parked: the reader polls again only once the channel is open.
+        const size_t polls = vdev::PollCalls(vdev::kPrn);
         ASSERT_EQ(CallService("USBPrintDrvOpen", false), 1);
         ASSERT_EQ(CallService("USBPrintDrvOpenChk", false), 1);
-        ASSERT_TRUE(CutsUsedUp()) << "the reader does not wait for data after the wake";
+        ASSERT_TRUE(WaitUntil([&] { return vdev::PollCalls(vdev::kPrn) > polls; }))
+            << "the reader does not wait for data after the wake";
+        ASSERT_TRUE(CutsUsedUp());
     }
 
     void Pull() {
