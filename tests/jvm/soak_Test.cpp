@@ -104,8 +104,9 @@ protected:
     // boundary; no transfer but a job's first or its closing UEL's starts with
     // ESC (a burst's first bytes select a host application).
     Job MakeJob() {
+        // Mostly small jobs (many job ends), now and then one of several reads.
         const size_t sizes[] = {16, 300, 4096, 65536, 600000, 2500000};
-        const size_t top = sizes[Pick(100) < 97 ? Pick(4) + 1 : Pick(2) + 4];
+        const size_t top = sizes[Pick(100) < 97 ? Pick(4) : 4 + Pick(2)];
         std::string body = "@PJL ENTER LANGUAGE=PCL\r\n";
         const size_t size = Pick(top) + 1;
         body.reserve(size + 32);
