@@ -16,6 +16,12 @@ struct Local {
     }
 };
 
+// A Java string of the calling thread, released at scope end (temporaries live
+// to the end of the call they are passed to).
+struct JStr : Local {
+    explicit JStr(const std::string &text) : Local{jvm::Env(), jvm::Str(jvm::Env(), text.c_str())} {}
+};
+
 std::string StaticString(const char *name, const char *sig, jint arg = 0) {
     JNIEnv *env = jvm::Env();
     Local s{env, jvm::CallStaticObject(kJournal, name, sig, arg)};
@@ -42,15 +48,11 @@ std::vector<std::string> EventLines() {
 }
 
 int Calls(const std::string &method) {
-    JNIEnv *env = jvm::Env();
-    Local s{env, jvm::Str(env, method.c_str())};
-    return jvm::CallStaticInt(kJournal, "calls", "(Ljava/lang/String;)I", s.obj);
+    return jvm::CallStaticInt(kJournal, "calls", "(Ljava/lang/String;)I", JStr(method).obj);
 }
 
 bool AwaitCalls(const std::string &method, int count, int timeoutMs) {
-    JNIEnv *env = jvm::Env();
-    Local s{env, jvm::Str(env, method.c_str())};
-    return jvm::CallStaticBoolean(kJournal, "awaitCalls", "(Ljava/lang/String;IJ)Z", s.obj, jint{count},
+    return jvm::CallStaticBoolean(kJournal, "awaitCalls", "(Ljava/lang/String;IJ)Z", JStr(method).obj, jint{count},
                                   jlong{timeoutMs});
 }
 
@@ -100,15 +102,11 @@ std::string Sha256(const std::string &bytes) {
 }
 
 void ThrowOn(const std::string &method, int times) {
-    JNIEnv *env = jvm::Env();
-    Local s{env, jvm::Str(env, method.c_str())};
-    jvm::CallStaticVoid(kJournal, "throwOn", "(Ljava/lang/String;I)V", s.obj, jint{times});
+    jvm::CallStaticVoid(kJournal, "throwOn", "(Ljava/lang/String;I)V", JStr(method).obj, jint{times});
 }
 
 void ReturnNull(const std::string &method, bool on) {
-    JNIEnv *env = jvm::Env();
-    Local s{env, jvm::Str(env, method.c_str())};
-    jvm::CallStaticVoid(kJournal, "returnNull", "(Ljava/lang/String;Z)V", s.obj, jboolean{on});
+    jvm::CallStaticVoid(kJournal, "returnNull", "(Ljava/lang/String;Z)V", JStr(method).obj, jboolean{on});
 }
 
 void SetPrinterStatus(int status) { jvm::CallStaticVoid(kJournal, "setPrinterStatus", "(I)V", jint{status}); }
@@ -124,23 +122,18 @@ void SetInterpreters(const std::vector<int> &ids) {
 }
 
 void SetReply(const std::string &method, const std::string &reply) {
-    JNIEnv *env = jvm::Env();
-    Local m{env, jvm::Str(env, method.c_str())};
-    Local r{env, jvm::Str(env, reply.c_str())};
-    jvm::CallStaticVoid(kJournal, "setReply", "(Ljava/lang/String;Ljava/lang/String;)V", m.obj, r.obj);
+    jvm::CallStaticVoid(kJournal, "setReply", "(Ljava/lang/String;Ljava/lang/String;)V", JStr(method).obj,
+                        JStr(reply).obj);
 }
 
 void SetIntReply(const std::string &method, int reply) {
-    JNIEnv *env = jvm::Env();
-    Local m{env, jvm::Str(env, method.c_str())};
-    jvm::CallStaticVoid(kJournal, "setIntReply", "(Ljava/lang/String;I)V", m.obj, jint{reply});
+    jvm::CallStaticVoid(kJournal, "setIntReply", "(Ljava/lang/String;I)V", JStr(method).obj, jint{reply});
 }
 
 void SetBytesReply(const std::string &method, const std::string &bytes) {
     JNIEnv *env = jvm::Env();
-    Local m{env, jvm::Str(env, method.c_str())};
     Local a{env, jvm::ByteArray(env, bytes)};
-    jvm::CallStaticVoid(kJournal, "setBytesReply", "(Ljava/lang/String;[B)V", m.obj, a.obj);
+    jvm::CallStaticVoid(kJournal, "setBytesReply", "(Ljava/lang/String;[B)V", JStr(method).obj, a.obj);
 }
 
 }  // namespace fixtures

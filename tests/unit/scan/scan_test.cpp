@@ -21,25 +21,32 @@
 #include "print/PrintRecorder.h"
 #include "scan/USBScan.h"
 #include "scan/scan_thread.h"
+#include "support/Bytes.h"
 #include "support/WaitUntil.h"
 #include "vdev.h"
 #include "vendor/VLX_Main.h"
 
+#define SCAN_JNI(name) Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_##name
 extern "C" {
-jint Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_USBScanDrvOpen(JNIEnv *,
-                                                                                                       jobject);
-jint Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_USBScanDrvClose(JNIEnv *,
-                                                                                                        jobject);
-void Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_readScanMsg(JNIEnv *, jobject,
-                                                                                                     jobject);
+jint SCAN_JNI(USBScanDrvOpen)(JNIEnv *, jobject);
+jint SCAN_JNI(USBScanDrvClose)(JNIEnv *, jobject);
+void SCAN_JNI(readScanMsg)(JNIEnv *, jobject, jobject);
 }
 
 namespace {
 
-std::string Bytes(std::initializer_list<int> bytes) {
-    std::string s;
-    for (int b : bytes) s.push_back(static_cast<char>(b));
-    return s;
+using Forwards = std::vector<std::pair<std::string, std::string>>;
+
+// Each transfer as Java got it: type and all bytes written.
+Forwards Forwarded() {
+    Forwards out;
+    for (const rec::App &a : rec::Apps()) {
+        std::string all;
+        for (const std::string &w : a.writes) all += w;
+        EXPECT_TRUE(a.closed) << a.type << " transfer not closed";
+        out.emplace_back(a.type, all);
+    }
+    return out;
 }
 
 class ScanTest : public ::testing::Test {
@@ -76,17 +83,6 @@ protected:
             ASSERT_LT(turns, 10000) << "the reader stopped taking host data";
             USBAdpScan_ReadTurn();
         }
-    }
-    // Each transfer as Java got it: type and all bytes written.
-    static std::vector<std::pair<std::string, std::string>> Forwarded() {
-        std::vector<std::pair<std::string, std::string>> out;
-        for (const rec::App &a : rec::Apps()) {
-            std::string all;
-            for (const std::string &w : a.writes) all += w;
-            EXPECT_TRUE(a.closed) << a.type << " transfer not closed";
-            out.emplace_back(a.type, all);
-        }
-        return out;
     }
     static std::string Reply() {
         auto r = vdev::HostRead(vdev::kScan);
@@ -174,15 +170,7 @@ TEST_F(PrintChannelScan, HandlersAnswerOnThePrintChannelAndTheNextJobIsWhole) {
     const std::string s2a = Bytes({0x1B, 0x9A, 0x01, 0, 0, 0, 0, 7});
     const std::string swallowed = Bytes({0x1B, 0x24, 0xF4, 0x07, 0, 0, 0, 0, 0, 0});
     Send({pcscan, job, light, s2a, swallowed, job});
-    const auto apps = rec::Apps();
-    ASSERT_EQ(apps.size(), 3u);
-    const std::pair<const char *, std::string> expected[] = {{"pcscan", pcscan}, {"taviklight", light}, {"scan2pc", s2a}};
-    for (size_t i = 0; i < 3; ++i) {
-        EXPECT_EQ(apps[i].type, expected[i].first);
-        std::string all;
-        for (const std::string &w : apps[i].writes) all += w;
-        EXPECT_EQ(all, expected[i].second);
-    }
+    EXPECT_EQ(Forwarded(), (Forwards{{"pcscan", pcscan}, {"taviklight", light}, {"scan2pc", s2a}}));
     const auto jobs = rec::Jobs();
     ASSERT_EQ(jobs.size(), 2u);
     EXPECT_EQ(jobs[0].bytes, job);
@@ -204,7 +192,7 @@ const std::string kIds = Bytes({0x1B, 0x91, 0, 0, 0, 0, 0, 3, 0, 0, 0, 1, 0, 0, 
 struct Case {
     const char *name;
     std::vector<std::string> transfers;                         // what the host sends
-    std::vector<std::pair<std::string, std::string>> forwarded;  // what Java gets
+    Forwards forwarded;                                         // what Java gets
     std::vector<const char *> lines;                            // logged once each
     size_t leftOver;  // bytes the reader takes for new packets afterwards
 };
@@ -334,7 +322,7 @@ TEST_F(ScanTest, AbsurdXmlLengthIsAFailedAllocationAndTheReaderGoesOn) {
         Send({Scan2AppHeader(0, size), Bytes({0x1B, 0xA8, 0, 0})});
         Drain();
         EXPECT_EQ(LoggerHost_Count("[USBAdp Scan] Error in allocation for pubAppXML, errno: 12\n"), 1);
-        EXPECT_EQ(Forwarded(), (std::vector<std::pair<std::string, std::string>>{{"pcscan", Bytes({0x1B, 0xA8, 0, 0})}}));
+        EXPECT_EQ(Forwarded(), (Forwards{{"pcscan", Bytes({0x1B, 0xA8, 0, 0})}}));
     }
 }
 
@@ -389,8 +377,8 @@ TEST_F(ScanTest, ReadErrorsEndTheHandlerWithTheirLine) {
 
 
 
-jint DrvOpen() { return Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_USBScanDrvOpen(nullptr, nullptr); }
-jint DrvClose() { return Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_USBScanDrvClose(nullptr, nullptr); }
+jint DrvOpen() { return SCAN_JNI(USBScanDrvOpen)(nullptr, nullptr); }
+jint DrvClose() { return SCAN_JNI(USBScanDrvClose)(nullptr, nullptr); }
 
 using ScanReader = ScanTest;
 
@@ -421,8 +409,7 @@ TEST_F(ScanReader, OpenAndCloseEntries) {
 
     // readScanMsg returns to Java when the node cannot be opened.
     LoggerHost_StartCapture();
-    Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_readScanMsg(nullptr, nullptr,
-                                                                                                    nullptr);
+    SCAN_JNI(readScanMsg)(nullptr, nullptr, nullptr);
     EXPECT_EQ(LoggerHost_Count("[USBAdp Scan] (env(0) == NULL) || (p_scan_obj(0) == NULL)\n"), 1);
 }
 
@@ -513,7 +500,6 @@ TEST_F(ScanReader, CloseWaitsForThePacketInProgress) {
         closer.join();
         EXPECT_EQ(closed.load(), 1);
         EXPECT_EQ(fdScan.load(), -1);
-        using Forwards = std::vector<std::pair<std::string, std::string>>;
         const Forwards expected = restComes ? Forwards{{"taviklight", head + "body!"}} : Forwards{};
         EXPECT_EQ(Forwarded(), expected);
         ASSERT_EQ(DrvOpen(), 1);
@@ -559,7 +545,7 @@ TEST_F(ScanReader, CloseAndReopenWhileTheHostSendsTakesNoPacketHalf) {
     ASSERT_TRUE(WaitUntil([&] { return LoggerHost_Count("[USBAdp Scan] USBAdpScan_TAVIK_Light() End\n") == kPackets; }));
     stop = true;
     reader.join();
-    std::vector<std::pair<std::string, std::string>> expected;
+    Forwards expected;
     for (const std::string &p : packets) expected.emplace_back("taviklight", p);
     EXPECT_EQ(Forwarded(), expected);
     EXPECT_FALSE(LoggerHost_Contains("not supported"));
