@@ -542,7 +542,7 @@ TEST_F(ScanReader, CloseAndReopenWhileTheHostSendsTakesNoPacketHalf) {
     }
     host.join();
     ASSERT_TRUE(WaitUntil([&] { return vdev::PendingHostBytes(vdev::kScan) == 0; }));
-    ASSERT_TRUE(WaitUntil([&] { return LoggerHost_Count("[USBAdp Scan] USBAdpScan_TAVIK_Light() End\n") == kPackets; }));
+    ASSERT_TRUE(WaitUntil([] { return LoggerHost_Count("[USBAdp Scan] USBAdpScan_TAVIK_Light() End\n") == kPackets; }));
     stop = true;
     reader.join();
     Forwards expected;
