@@ -5,6 +5,7 @@
 #include <atomic>
 #include <string>
 
+#include "common/JniUtil.h"
 #include "print_Support.h"
 
 namespace {
@@ -64,18 +65,14 @@ protected:
     }
     jobject Of(const char *cls) const { return cls == jvm::kPluginAdapter ? plugin_ : kivoro_; }
     // Calls `method(byte[])`; a null `bytes` passes null.
+    static LocalRef<jbyteArray> Array(const std::string &bytes) {
+        return {jvm::Env(), jvm::ByteArray(jvm::Env(), bytes)};
+    }
     void Call(jobject obj, const char *method, const std::string *bytes) {
-        JNIEnv *env = jvm::Env();
-        jbyteArray a = bytes ? jvm::ByteArray(env, *bytes) : nullptr;
-        jvm::CallVoid(obj, method, "([B)V", a);
-        if (a) env->DeleteLocalRef(a);
+        jvm::CallVoid(obj, method, "([B)V", bytes ? Array(*bytes).get() : nullptr);
     }
     jint ScanEvent(const std::string &bytes, jint len) {
-        JNIEnv *env = jvm::Env();
-        jbyteArray a = jvm::ByteArray(env, bytes);
-        jint r = jvm::CallInt(service_, "sendScanToPCEventData", "([BI)I", a, len);
-        env->DeleteLocalRef(a);
-        return r;
+        return jvm::CallInt(service_, "sendScanToPCEventData", "([BI)I", Array(bytes).get(), len);
     }
     void ClosePrintChannel() { ASSERT_EQ(printjvm::Hibernate(service_), 1); }
     size_t DataBlocks() {
@@ -206,10 +203,7 @@ TEST_F(VendorRecords, ClosedChannelWritesTheStandardErrorLinesAndStagesNothing) 
     EXPECT_EQ(vdev::VendorRecords().size(), before);
 
     // The back channel writes nothing either.
-    JNIEnv *env = jvm::Env();
-    jbyteArray a = jvm::ByteArray(env, "response");
-    jvm::CallVoid(service_, "sendBackChannelData", "([BI)V", a, 8);
-    env->DeleteLocalRef(a);
+    jvm::CallVoid(service_, "sendBackChannelData", "([BI)V", Array("response").get(), 8);
     EXPECT_TRUE(vdev::HostRead(vdev::kPrn).empty());
     EXPECT_TRUE(LoggerHost_Contains("[UsbAdp] [write] fdPrn <= 0"));
 }
