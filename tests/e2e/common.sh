@@ -12,25 +12,23 @@ fail() {
     echo "(files kept in $dir)"
     exit 1
 }
+# wait_for TRIES WHY CMD...: runs CMD every 50 ms until it succeeds; fails
+# with WHY after TRIES tries.
+wait_for() {
+    local tries=$1 why=$2 i=0
+    shift 2
+    until "$@"; do
+        i=$((i + 1))
+        [ $i -lt "$tries" ] || fail "$why"
+        sleep 0.05
+    done
+}
 # until_lines N PATTERN FILE: waits (bounded) for N lines matching PATTERN.
-until_lines() {
-    local i=0
-    until [ "$(grep -c "$2" "$3" 2>/dev/null)" -ge "$1" ]; do
-        i=$((i + 1))
-        [ $i -lt 1200 ] || fail "$(grep -c "$2" "$3" 2>/dev/null) lines of $2 in $3, expected $1"
-        sleep 0.05
-    done
-}
+has_lines() { [ "$(grep -c "$2" "$3" 2>/dev/null)" -ge "$1" ]; }
+until_lines() { wait_for 1200 "fewer than $1 lines of $2 in $3" has_lines "$@"; }
 # until_link PATH WHAT: waits (bounded) for the simulator's link PATH while it runs.
-until_link() {
-    local i=0
-    until [ -L "$1" ]; do
-        i=$((i + 1))
-        [ $i -lt 600 ] || fail "no $2 at $1"
-        kill -0 "$pid" 2>/dev/null || fail "the simulator ended before making $2"
-        sleep 0.05
-    done
-}
+has_link() { [ -L "$1" ] || { kill -0 "$pid" 2>/dev/null || fail "the simulator ended before making $2"; false; }; }
+until_link() { wait_for 600 "no $2 at $1" has_link "$@"; }
 # sim_bg OUT ARGS...: the simulator in the background (pid), output in OUT.txt.
 sim_bg() {
     local out=$1

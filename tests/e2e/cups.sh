@@ -78,12 +78,8 @@ for i in 1 2 3 4 5; do
     lp -d sim -o raw -t "job$i" "$dir/job$i" >>"$dir/lp.txt" 2>&1 || fail "lp: $(cat "$dir/lp.txt")"
 done
 until_lines 5 '"event":"job-end"' "$dir/out/journal.jsonl"
-i=0
-until [ -z "$(lpstat -o 2>/dev/null)" ]; do
-    i=$((i + 1))
-    [ $i -lt 200 ] || fail "CUPS still holds jobs: $(lpstat -o)"
-    sleep 0.05
-done
+queue_empty() { [ -z "$(lpstat -o 2>/dev/null)" ]; }
+wait_for 200 "CUPS still holds jobs" queue_empty
 for i in 1 2 3 4 5; do
     cmp -s "$dir/job$i" "$dir/out/$(printf 'job-%03d.prn' "$i")" || fail "job $i differs from what was queued"
 done

@@ -3,29 +3,25 @@
 #include <sstream>
 
 #include "JvmHarness.h"
+#include "common/JniUtil.h"
 
 namespace fixtures {
 namespace {
 
-// A local reference released at scope end.
-struct Local {
-    JNIEnv *env;
-    jobject obj;
-    ~Local() {
-        if (obj) env->DeleteLocalRef(obj);
-    }
-};
+using Local = LocalRef<jobject>;
+
+// A Java string of the calling thread, released at scope end (a temporary lives
+// to the end of the call it is passed to).
+LocalRef<jstring> JStr(const std::string &text) { return {jvm::Env(), jvm::Str(jvm::Env(), text.c_str())}; }
 
 std::string StaticString(const char *name, const char *sig, jint arg = 0) {
-    JNIEnv *env = jvm::Env();
-    Local s{env, jvm::CallStaticObject(kJournal, name, sig, arg)};
-    return jvm::Text(env, static_cast<jstring>(s.obj));
+    Local s{jvm::Env(), jvm::CallStaticObject(kJournal, name, sig, arg)};
+    return jvm::Text(jvm::Env(), static_cast<jstring>(s.get()));
 }
 
 std::string StaticBytes(const char *name, jint arg) {
-    JNIEnv *env = jvm::Env();
-    Local a{env, jvm::CallStaticObject(kJournal, name, "(I)[B", arg)};
-    return jvm::Bytes(env, static_cast<jbyteArray>(a.obj));
+    Local a{jvm::Env(), jvm::CallStaticObject(kJournal, name, "(I)[B", arg)};
+    return jvm::Bytes(jvm::Env(), static_cast<jbyteArray>(a.get()));
 }
 
 }  // namespace
@@ -42,15 +38,11 @@ std::vector<std::string> EventLines() {
 }
 
 int Calls(const std::string &method) {
-    JNIEnv *env = jvm::Env();
-    Local s{env, jvm::Str(env, method.c_str())};
-    return jvm::CallStaticInt(kJournal, "calls", "(Ljava/lang/String;)I", s.obj);
+    return jvm::CallStaticInt(kJournal, "calls", "(Ljava/lang/String;)I", JStr(method).get());
 }
 
 bool AwaitCalls(const std::string &method, int count, int timeoutMs) {
-    JNIEnv *env = jvm::Env();
-    Local s{env, jvm::Str(env, method.c_str())};
-    return jvm::CallStaticBoolean(kJournal, "awaitCalls", "(Ljava/lang/String;IJ)Z", s.obj, jint{count},
+    return jvm::CallStaticBoolean(kJournal, "awaitCalls", "(Ljava/lang/String;IJ)Z", JStr(method).get(), jint{count},
                                   jlong{timeoutMs});
 }
 
@@ -63,8 +55,8 @@ std::string JobBytes(int job) { return StaticBytes("jobBytes", job); }
 std::vector<int> JobChunkSizes(int job) {
     JNIEnv *env = jvm::Env();
     Local a{env, jvm::CallStaticObject(kJournal, "jobChunkSizes", "(I)[I", jint{job})};
-    if (!a.obj) return {};
-    auto arr = static_cast<jintArray>(a.obj);
+    if (!a) return {};
+    auto arr = static_cast<jintArray>(a.get());
     std::vector<jint> raw(static_cast<size_t>(env->GetArrayLength(arr)));
     env->GetIntArrayRegion(arr, 0, static_cast<jsize>(raw.size()), raw.data());
     return {raw.begin(), raw.end()};
@@ -94,21 +86,17 @@ bool AppClosed(int app) { return jvm::CallStaticBoolean(kJournal, "appClosed", "
 
 std::string Sha256(const std::string &bytes) {
     JNIEnv *env = jvm::Env();
-    Local a{env, jvm::ByteArray(env, bytes)};
-    Local s{env, jvm::CallStaticObject(kJournal, "sha256", "([B)Ljava/lang/String;", a.obj)};
-    return jvm::Text(env, static_cast<jstring>(s.obj));
+    LocalRef<jbyteArray> a{env, jvm::ByteArray(env, bytes)};
+    Local s{env, jvm::CallStaticObject(kJournal, "sha256", "([B)Ljava/lang/String;", a.get())};
+    return jvm::Text(env, static_cast<jstring>(s.get()));
 }
 
 void ThrowOn(const std::string &method, int times) {
-    JNIEnv *env = jvm::Env();
-    Local s{env, jvm::Str(env, method.c_str())};
-    jvm::CallStaticVoid(kJournal, "throwOn", "(Ljava/lang/String;I)V", s.obj, jint{times});
+    jvm::CallStaticVoid(kJournal, "throwOn", "(Ljava/lang/String;I)V", JStr(method).get(), jint{times});
 }
 
 void ReturnNull(const std::string &method, bool on) {
-    JNIEnv *env = jvm::Env();
-    Local s{env, jvm::Str(env, method.c_str())};
-    jvm::CallStaticVoid(kJournal, "returnNull", "(Ljava/lang/String;Z)V", s.obj, jboolean{on});
+    jvm::CallStaticVoid(kJournal, "returnNull", "(Ljava/lang/String;Z)V", JStr(method).get(), jboolean{on});
 }
 
 void SetPrinterStatus(int status) { jvm::CallStaticVoid(kJournal, "setPrinterStatus", "(I)V", jint{status}); }
@@ -116,31 +104,24 @@ void SetPrinterStatus(int status) { jvm::CallStaticVoid(kJournal, "setPrinterSta
 void SetInterpreters(const std::vector<int> &ids) {
     JNIEnv *env = jvm::Env();
     std::vector<jint> raw(ids.begin(), ids.end());
-    jintArray arr = env->NewIntArray(static_cast<jsize>(raw.size()));
-    Local a{env, arr};
+    LocalRef<jintArray> arr{env, env->NewIntArray(static_cast<jsize>(raw.size()))};
     if (!arr) return;
-    env->SetIntArrayRegion(arr, 0, static_cast<jsize>(raw.size()), raw.data());
-    jvm::CallStaticVoid(kJournal, "setInterpreters", "([I)V", arr);
+    env->SetIntArrayRegion(arr.get(), 0, static_cast<jsize>(raw.size()), raw.data());
+    jvm::CallStaticVoid(kJournal, "setInterpreters", "([I)V", arr.get());
 }
 
 void SetReply(const std::string &method, const std::string &reply) {
-    JNIEnv *env = jvm::Env();
-    Local m{env, jvm::Str(env, method.c_str())};
-    Local r{env, jvm::Str(env, reply.c_str())};
-    jvm::CallStaticVoid(kJournal, "setReply", "(Ljava/lang/String;Ljava/lang/String;)V", m.obj, r.obj);
+    jvm::CallStaticVoid(kJournal, "setReply", "(Ljava/lang/String;Ljava/lang/String;)V", JStr(method).get(),
+                        JStr(reply).get());
 }
 
 void SetIntReply(const std::string &method, int reply) {
-    JNIEnv *env = jvm::Env();
-    Local m{env, jvm::Str(env, method.c_str())};
-    jvm::CallStaticVoid(kJournal, "setIntReply", "(Ljava/lang/String;I)V", m.obj, jint{reply});
+    jvm::CallStaticVoid(kJournal, "setIntReply", "(Ljava/lang/String;I)V", JStr(method).get(), jint{reply});
 }
 
 void SetBytesReply(const std::string &method, const std::string &bytes) {
-    JNIEnv *env = jvm::Env();
-    Local m{env, jvm::Str(env, method.c_str())};
-    Local a{env, jvm::ByteArray(env, bytes)};
-    jvm::CallStaticVoid(kJournal, "setBytesReply", "(Ljava/lang/String;[B)V", m.obj, a.obj);
+    LocalRef<jbyteArray> a{jvm::Env(), jvm::ByteArray(jvm::Env(), bytes)};
+    jvm::CallStaticVoid(kJournal, "setBytesReply", "(Ljava/lang/String;[B)V", JStr(method).get(), a.get());
 }
 
 }  // namespace fixtures

@@ -1,6 +1,7 @@
 #include "JvmHarness.h"
 
 #include "JvmHost.h"
+#include "common/JniUtil.h"
 
 #include <gtest/gtest.h>
 
@@ -142,15 +143,9 @@ jstring Str(JNIEnv *env, const char *text) {
 }
 
 std::string Text(JNIEnv *env, jstring s) {
-    if (!s) return {};
-    const char *chars = env->GetStringUTFChars(s, nullptr);
-    if (!chars) {
-        FailOnException(env, "GetStringUTFChars");
-        return {};
-    }
-    std::string text(chars);
-    env->ReleaseStringUTFChars(s, chars);
-    return text;
+    UtfChars chars(env, s);
+    if (s && !chars) FailOnException(env, "GetStringUTFChars");
+    return chars ? chars.get() : "";
 }
 
 std::string Bytes(JNIEnv *env, jbyteArray a) {

@@ -6,14 +6,9 @@
 #include <gtest/gtest.h>
 
 #include "print_Support.h"
+#include "support/Bytes.h"
 
 namespace {
-
-std::string Bytes(std::initializer_list<int> bytes) {
-    std::string s;
-    for (int b : bytes) s.push_back(static_cast<char>(b));
-    return s;
-}
 
 const std::string kSizeRequest = Bytes({0x1B, 0x24, 0xF4, 0x00, 0, 0, 0, 0, 0, 0});
 const std::string kDataRequest = Bytes({0x1B, 0x24, 0xF4, 0x01, 0, 0, 0, 0, 0, 0});

@@ -7,23 +7,16 @@
 
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 
 #include <gtest/gtest.h>
 
 #include "LoggerHost.h"
 #include "adapter/USB.h"
+#include "support/Bytes.h"
 #include "support/MsgQueue.h"
 #include "support/TempRoot.h"
 
 namespace {
-
-std::string ReadFile(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    std::stringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
-}
 
 class BridgeQueues : public ::testing::Test {
 protected:
@@ -120,13 +113,6 @@ TEST_F(BridgeQueues, InitDevicePostsOneInitMessageOfEightBytes) {
     EXPECT_EQ(raw.text[0] | raw.text[1] << 8 | raw.text[2] << 16 | raw.text[3] << 24, MFP_DEV_INIT);
     EXPECT_EQ(TakeQueueStatus(globalPrnMsgQ), std::nullopt);
     EXPECT_EQ(TakeQueueStatus(globalScanMsgQ), std::nullopt);
-}
-
-TEST_F(BridgeQueues, InitDeviceWithoutQueueReportsFailure) {
-    globalPrnMsgQ = -1;
-    EXPECT_EQ(USBAdapter_IF_InitDevice(), 0);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp][USB]-1, 1, 0\n"), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp][USB]Prn_msgQ message can't be send. \n"), 1);
 }
 
 }  // namespace

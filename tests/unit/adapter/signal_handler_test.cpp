@@ -145,25 +145,6 @@ TEST_F(SignalHandler, FailedNotificationReadIsLoggedAndIgnored) {
     EXPECT_EQ(Scan(), std::nullopt);
 }
 
-TEST_F(SignalHandler, RealSignalFromTheDriverReachesTheQueue) {
-    struct sigaction sa{};
-    sa.sa_handler = PrnScanSighandler;
-    sigemptyset(&sa.sa_mask);
-    ASSERT_EQ(sigaction(SIGIO, &sa, nullptr), 0);
-    ASSERT_EQ(fcntl(fd, F_SETOWN, getpid()), 0);
-    ASSERT_EQ(fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_ASYNC), 0);
-
-    vdev::QueueNotification(vdev::kPrn, Notif(MFP_DEV_CONFIGURED, eMfp_Notif_Prn));
-    std::optional<int> got;
-    for (int i = 0; i < 200 && !got; ++i) {
-        got = Print();
-        if (!got) std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    EXPECT_EQ(got, MFP_DEV_CONFIGURED);
-    EXPECT_EQ(IsConfigured.load(), 1);
-    signal(SIGIO, SIG_IGN);
-}
-
 // The handler must not take the logger's lock: interrupt a thread that logs
 // without pause, many times, and check every handler line arrives.
 TEST_F(SignalHandler, RunsSafelyWhileAnotherThreadIsLogging) {

@@ -4,8 +4,6 @@
 #include <unistd.h>
 
 #include <cstring>
-#include <fstream>
-#include <sstream>
 #include <string>
 
 #include <gtest/gtest.h>
@@ -16,6 +14,7 @@
 #include "adapter/ProductConfig.h"
 #include "adapter/SerialNumber.h"
 #include "adapter/USB.h"
+#include "support/Bytes.h"
 #include "support/TempRoot.h"
 #include "vdev.h"
 
@@ -213,13 +212,8 @@ TEST_F(Identity, ReportFileTakesFourCharactersAndTheSeriesName) {
         {"AB", "AB\tTW-M4000 Series"},
     };
     for (const Case &c : cases) {
-        U8 *buf = static_cast<U8 *>(std::malloc(std::strlen(c.in) + 1));
-        std::strcpy(reinterpret_cast<char *>(buf), c.in);
-        WriteSerialString(buf);  // frees buf
-        std::ifstream f(root_ / REPORT_FILE);
-        std::stringstream ss;
-        ss << f.rdbuf();
-        EXPECT_EQ(ss.str(), c.file);
+        WriteSerialString(reinterpret_cast<U8 *>(::strdup(c.in)));  // takes the buffer
+        EXPECT_EQ(ReadFile(root_ / REPORT_FILE), c.file);
     }
 }
 

@@ -21,25 +21,32 @@
 #include "print/PrintRecorder.h"
 #include "scan/USBScan.h"
 #include "scan/scan_thread.h"
+#include "support/Bytes.h"
 #include "support/WaitUntil.h"
 #include "vdev.h"
 #include "vendor/VLX_Main.h"
 
+#define SCAN_JNI(name) Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_##name
 extern "C" {
-jint Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_USBScanDrvOpen(JNIEnv *,
-                                                                                                       jobject);
-jint Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_USBScanDrvClose(JNIEnv *,
-                                                                                                        jobject);
-void Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_readScanMsg(JNIEnv *, jobject,
-                                                                                                     jobject);
+jint SCAN_JNI(USBScanDrvOpen)(JNIEnv *, jobject);
+jint SCAN_JNI(USBScanDrvClose)(JNIEnv *, jobject);
+void SCAN_JNI(readScanMsg)(JNIEnv *, jobject, jobject);
 }
 
 namespace {
 
-std::string Bytes(std::initializer_list<int> bytes) {
-    std::string s;
-    for (int b : bytes) s.push_back(static_cast<char>(b));
-    return s;
+using Forwards = std::vector<std::pair<std::string, std::string>>;
+
+// Each transfer as Java got it: type and all bytes written.
+Forwards Forwarded() {
+    Forwards out;
+    for (const rec::App &a : rec::Apps()) {
+        std::string all;
+        for (const std::string &w : a.writes) all += w;
+        EXPECT_TRUE(a.closed) << a.type << " transfer not closed";
+        out.emplace_back(a.type, all);
+    }
+    return out;
 }
 
 class ScanTest : public ::testing::Test {
@@ -76,17 +83,6 @@ protected:
             ASSERT_LT(turns, 10000) << "the reader stopped taking host data";
             USBAdpScan_ReadTurn();
         }
-    }
-    // Each transfer as Java got it: type and all bytes written.
-    static std::vector<std::pair<std::string, std::string>> Forwarded() {
-        std::vector<std::pair<std::string, std::string>> out;
-        for (const rec::App &a : rec::Apps()) {
-            std::string all;
-            for (const std::string &w : a.writes) all += w;
-            EXPECT_TRUE(a.closed) << a.type << " transfer not closed";
-            out.emplace_back(a.type, all);
-        }
-        return out;
     }
     static std::string Reply() {
         auto r = vdev::HostRead(vdev::kScan);
@@ -174,15 +170,7 @@ TEST_F(PrintChannelScan, HandlersAnswerOnThePrintChannelAndTheNextJobIsWhole) {
     const std::string s2a = Bytes({0x1B, 0x9A, 0x01, 0, 0, 0, 0, 7});
     const std::string swallowed = Bytes({0x1B, 0x24, 0xF4, 0x07, 0, 0, 0, 0, 0, 0});
     Send({pcscan, job, light, s2a, swallowed, job});
-    const auto apps = rec::Apps();
-    ASSERT_EQ(apps.size(), 3u);
-    const std::pair<const char *, std::string> expected[] = {{"pcscan", pcscan}, {"taviklight", light}, {"scan2pc", s2a}};
-    for (size_t i = 0; i < 3; ++i) {
-        EXPECT_EQ(apps[i].type, expected[i].first);
-        std::string all;
-        for (const std::string &w : apps[i].writes) all += w;
-        EXPECT_EQ(all, expected[i].second);
-    }
+    EXPECT_EQ(Forwarded(), (Forwards{{"pcscan", pcscan}, {"taviklight", light}, {"scan2pc", s2a}}));
     const auto jobs = rec::Jobs();
     ASSERT_EQ(jobs.size(), 2u);
     EXPECT_EQ(jobs[0].bytes, job);
@@ -203,48 +191,48 @@ const std::string kIds = Bytes({0x1B, 0x91, 0, 0, 0, 0, 0, 3, 0, 0, 0, 1, 0, 0, 
 
 struct Case {
     const char *name;
-    std::vector<std::string> transfers;                         // what the host sends
-    std::vector<std::pair<std::string, std::string>> forwarded;  // what Java gets
-    std::vector<const char *> lines;                            // logged once each
-    size_t leftOver;  // bytes the reader takes for new packets afterwards
+    std::vector<std::string> transfers;  // what the host sends
+    Forwards forwarded;                  // what Java gets
+    std::vector<const char *> lines;     // logged once each
 };
 
-TEST_F(ScanTest, EachProtocolForwardsExactlyItsPacket) {
+// Each protocol forwards exactly its packet; what no handler takes, or a length
+// past what can be held, is logged and dropped, and the reader goes on.
+TEST_F(ScanTest, EachProtocolForwardsExactlyItsPacketAndDropsTheRest) {
     const std::string pcscan0 = Bytes({0x1B, 0xA8, 0x10, 0x00});
     const std::string setWindow = Bytes({0x1B, 0xA8, 0x24, 0x13}) + std::string(0x15, 'w');
     const std::string light255 = Bytes({0x1B, 0xAA, 0x01, 0xFF}) + std::string(255, 'L');
     const std::string xml20 = "<apps><a>scan</a></apps>";
+    const std::string s2a20 = Scan2AppHeader(3, static_cast<U32>(xml20.size()));
+    const char *noXml = "[USBAdp Scan] Error in allocation for pubAppXML, errno: 12\n";
     const Case cases[] = {
-        {"pc-scan L 0", {pcscan0}, {{"pcscan", pcscan0}}, {"[USBAdp Scan] slPCScanCDBSize: 4\n"}, 0},
-        {"pc-scan set window takes L + 2",
-         {setWindow},
-         {{"pcscan", setWindow}},
-         {"[USBAdp Scan] PCScan packet size for SET WINDOW PARAMETER (1B A8 24 13): 21\n"},
-         0},
-        {"pc-scan in pieces", {"\x1b\xa8", "\x10\x05", "ab", "cde"}, {{"pcscan", "\x1b\xa8\x10\x05" "abcde"}}, {}, 0},
-        {"pc-scan 1B A8 24 FE is refused, its bytes stay",
-         {Bytes({0x1B, 0xA8, 0x24, 0xFE})},
-         {},
-         {"[USBAdp Scan] slPacketSize[0x100] > 0xFF\n", "[USBAdp Scan] USBAdpScan_PCScan() failed\n"},
-         0},
+        {"pc-scan L 0", {pcscan0}, {{"pcscan", pcscan0}}, {"[USBAdp Scan] slPCScanCDBSize: 4\n"}},
+        {"pc-scan set window takes L + 2", {setWindow}, {{"pcscan", setWindow}},
+         {"[USBAdp Scan] PCScan packet size for SET WINDOW PARAMETER (1B A8 24 13): 21\n"}},
+        {"pc-scan in pieces", {"\x1b\xa8", "\x10\x05", "ab", "cde"}, {{"pcscan", "\x1b\xa8\x10\x05" "abcde"}}, {}},
+        {"pc-scan 1B A8 24 FE is refused", {Bytes({0x1B, 0xA8, 0x24, 0xFE})}, {},
+         {"[USBAdp Scan] slPacketSize[0x100] > 0xFF\n", "[USBAdp Scan] USBAdpScan_PCScan() failed\n"}},
         {"light protocol L 255 fills the buffer", {light255}, {{"taviklight", light255}},
-         {"[USBAdp Scan] slTAVIK_Light_command_size: 259\n"}, 0},
-        {"scan-to-application kind 1 is its header",
-         {Scan2AppHeader(1, 0x40)},
-         {{"scan2pc", Scan2AppHeader(1, 0x40)}},
-         {"[USBAdp Scan] USB Get User Selected List sent\n"},
-         0},
-        {"kind 0 with an XML of 5 forwards only the header",
-         {Scan2AppHeader(0, 5), "<a/>\n"},
-         {{"scan2pc", Scan2AppHeader(0, 5)}},
-         {"[USBAdp Scan] USB Send Application List sent\n"},
-         0},
-        {"kind 3 forwards header and XML",
-         {Scan2AppHeader(3, static_cast<U32>(xml20.size())), xml20.substr(0, 7), xml20.substr(7)},
-         {{"scan2pc", Scan2AppHeader(3, static_cast<U32>(xml20.size())) + xml20}},
-         {},
-         0},
-        {"ID-scan", {kIds}, {{"ids", kIds}}, {}, 0},
+         {"[USBAdp Scan] slTAVIK_Light_command_size: 259\n"}},
+        {"scan-to-application kind 1 is its header", {Scan2AppHeader(1, 0x40)}, {{"scan2pc", Scan2AppHeader(1, 0x40)}},
+         {"[USBAdp Scan] USB Get User Selected List sent\n"}},
+        {"kind 0 with an XML of 5 forwards only the header", {Scan2AppHeader(0, 5), "<a/>\n"},
+         {{"scan2pc", Scan2AppHeader(0, 5)}}, {"[USBAdp Scan] USB Send Application List sent\n"}},
+        {"kind 3 forwards header and XML", {s2a20, xml20.substr(0, 7), xml20.substr(7)}, {{"scan2pc", s2a20 + xml20}},
+         {}},
+        {"ID-scan", {kIds}, {{"ids", kIds}}, {}},
+        {"XML length 0xFFFFFFFF", {Scan2AppHeader(0, 0xFFFFFFFFu), pcscan0}, {{"pcscan", pcscan0}}, {noXml}},
+        {"XML length 0x80000000", {Scan2AppHeader(0, 0x80000000u), pcscan0}, {{"pcscan", pcscan0}}, {noXml}},
+        {"XML length past the limit", {Scan2AppHeader(0, SCAN2APP_XML_MAX + 1), pcscan0}, {{"pcscan", pcscan0}},
+         {noXml}},
+        {"1B 77", {Bytes({0x1B, 0x77})}, {}, {"[USBAdp Scan] HostApp not supported [0x1b 0x77]\n"}},
+        {"41 1B", {Bytes({0x41, 0x1B})}, {}, {"[USBAdp Scan] HOSTApp not supported [0x41 0x1b]\n"}},
+        // One byte, judged on the cleared rest.
+        {"1B alone", {Bytes({0x1B})}, {}, {"[USBAdp Scan] HostApp not supported [0x1b 0]\n"}},
+        {"7F alone", {Bytes({0x7F})}, {}, {"[USBAdp Scan] HOSTApp not supported [0x7f 0]\n"}},
+        {"ID-scan, last byte 1", {kIds.substr(0, 15) + "\x01"}, {}, {"[USBAdp Scan] Not IDS header\n"}},
+        // 1B 91 and 5 bytes, zero-filled to 16: bytes 7 (3) and 11 (1) are missing.
+        {"ID-scan cut", {kIds.substr(0, 7)}, {}, {"[USBAdp Scan] Not IDS packet\n"}},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.name);
@@ -254,32 +242,7 @@ TEST_F(ScanTest, EachProtocolForwardsExactlyItsPacket) {
         Drain();
         EXPECT_EQ(Forwarded(), c.forwarded);
         for (const char *line : c.lines) EXPECT_EQ(LoggerHost_Count(line), 1) << line;
-        EXPECT_EQ(vdev::PendingHostBytes(vdev::kScan), c.leftOver);
         EXPECT_EQ(Reply(), "");
-    }
-}
-
-TEST_F(ScanTest, WhatNoHandlerTakesIsLoggedAndDropped) {
-    struct Row {
-        std::string transfer;
-        const char *line;
-    } rows[] = {
-        {Bytes({0x1B, 0x77}), "[USBAdp Scan] HostApp not supported [0x1b 0x77]\n"},
-        {Bytes({0x41, 0x1B}), "[USBAdp Scan] HOSTApp not supported [0x41 0x1b]\n"},
-        {Bytes({0x1B}), "[USBAdp Scan] HostApp not supported [0x1b 0]\n"},  // one byte, judged on the cleared rest
-        {Bytes({0x7F}), "[USBAdp Scan] HOSTApp not supported [0x7f 0]\n"},
-        {kIds.substr(0, 15) + "\x01", "[USBAdp Scan] Not IDS header\n"},
-        // 1B 91 and 5 bytes, zero-filled to 16: bytes 7 (3) and 11 (1) are missing.
-        {kIds.substr(0, 7), "[USBAdp Scan] Not IDS packet\n"},
-    };
-    for (const Row &r : rows) {
-        SCOPED_TRACE(r.line);
-        rec::Clear();
-        LoggerHost_StartCapture();
-        Send({r.transfer});
-        Drain();
-        EXPECT_EQ(LoggerHost_Count(r.line), 1);
-        EXPECT_TRUE(rec::Events().empty());
     }
 }
 
@@ -324,17 +287,6 @@ TEST_F(ScanTest, JavaRefusalsEndTheTransferWithItsLine) {
         Drain();
         EXPECT_EQ(LoggerHost_Count(r.line), 1);
         EXPECT_EQ(call, r.failAt) << "went on after the refusal";
-    }
-}
-
-TEST_F(ScanTest, AbsurdXmlLengthIsAFailedAllocationAndTheReaderGoesOn) {
-    for (U32 size : {0xFFFFFFFFu, 0x80000000u, SCAN2APP_XML_MAX + 1}) {
-        rec::Clear();
-        LoggerHost_StartCapture();
-        Send({Scan2AppHeader(0, size), Bytes({0x1B, 0xA8, 0, 0})});
-        Drain();
-        EXPECT_EQ(LoggerHost_Count("[USBAdp Scan] Error in allocation for pubAppXML, errno: 12\n"), 1);
-        EXPECT_EQ(Forwarded(), (std::vector<std::pair<std::string, std::string>>{{"pcscan", Bytes({0x1B, 0xA8, 0, 0})}}));
     }
 }
 
@@ -389,8 +341,8 @@ TEST_F(ScanTest, ReadErrorsEndTheHandlerWithTheirLine) {
 
 
 
-jint DrvOpen() { return Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_USBScanDrvOpen(nullptr, nullptr); }
-jint DrvClose() { return Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_USBScanDrvClose(nullptr, nullptr); }
+jint DrvOpen() { return SCAN_JNI(USBScanDrvOpen)(nullptr, nullptr); }
+jint DrvClose() { return SCAN_JNI(USBScanDrvClose)(nullptr, nullptr); }
 
 using ScanReader = ScanTest;
 
@@ -421,8 +373,7 @@ TEST_F(ScanReader, OpenAndCloseEntries) {
 
     // readScanMsg returns to Java when the node cannot be opened.
     LoggerHost_StartCapture();
-    Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_readScanMsg(nullptr, nullptr,
-                                                                                                    nullptr);
+    SCAN_JNI(readScanMsg)(nullptr, nullptr, nullptr);
     EXPECT_EQ(LoggerHost_Count("[USBAdp Scan] (env(0) == NULL) || (p_scan_obj(0) == NULL)\n"), 1);
 }
 
@@ -513,7 +464,6 @@ TEST_F(ScanReader, CloseWaitsForThePacketInProgress) {
         closer.join();
         EXPECT_EQ(closed.load(), 1);
         EXPECT_EQ(fdScan.load(), -1);
-        using Forwards = std::vector<std::pair<std::string, std::string>>;
         const Forwards expected = restComes ? Forwards{{"taviklight", head + "body!"}} : Forwards{};
         EXPECT_EQ(Forwarded(), expected);
         ASSERT_EQ(DrvOpen(), 1);
@@ -556,10 +506,10 @@ TEST_F(ScanReader, CloseAndReopenWhileTheHostSendsTakesNoPacketHalf) {
     }
     host.join();
     ASSERT_TRUE(WaitUntil([&] { return vdev::PendingHostBytes(vdev::kScan) == 0; }));
-    ASSERT_TRUE(WaitUntil([&] { return LoggerHost_Count("[USBAdp Scan] USBAdpScan_TAVIK_Light() End\n") == kPackets; }));
+    ASSERT_TRUE(WaitUntil([] { return LoggerHost_Count("[USBAdp Scan] USBAdpScan_TAVIK_Light() End\n") == kPackets; }));
     stop = true;
     reader.join();
-    std::vector<std::pair<std::string, std::string>> expected;
+    Forwards expected;
     for (const std::string &p : packets) expected.emplace_back("taviklight", p);
     EXPECT_EQ(Forwarded(), expected);
     EXPECT_FALSE(LoggerHost_Contains("not supported"));
