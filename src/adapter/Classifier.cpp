@@ -232,6 +232,8 @@ S32 classifyIds(U8 *pubCommand, U8 *pubfirmware_command, S32 *slfirmRes) {
 
 }  // namespace
 
+TUSBAdp_ParserID USBAdp_ParserOf(const U8 *pubCommand) { return classOf(pubCommand); }
+
 S32 USBADP_CheckDCUApp(U8 *hdr) { return checkApp(kDCU, hdr); }
 S32 USBADP_CheckAMPVApp(U8 *hdr) { return checkApp(kAMPV, hdr); }
 S32 USBADP_CheckNDApp(U8 *hdr) { return checkApp(kND, hdr); }

@@ -39,6 +39,9 @@ extern const char aubHostApp[11][HOST_APP_NAME_SIZE];
 S32 USBAdpater_StartDataClassifier(U8 *pubCommand, U8 *pubfirmware_command, S32 *slfirmRes,
                                    TUSBAdp_ParserID *enParserID);
 
+// The class the two bytes select; enOther when no host application.
+TUSBAdp_ParserID USBAdp_ParserOf(const U8 *pubCommand);
+
 // Given the 16-byte header: 1 recognised and delivered, 0 not this
 // application, -2 recognised but delivery failed.
 S32 USBADP_CheckDCUApp(U8 *hdr);

@@ -45,7 +45,7 @@ constexpr char kManufacturer[] = "Tarnwel Electronics Co., Ltd.";
 static_assert(TEMP_SEND_BUFFER_SIZE >= FRM_DETECT_BUFFER_SIZE + RX_BUFFER_SIZE);
 
 // Allocated once when reading starts and kept for the life of the process.
-U8 *received_data;       // allocated with the others; reads go into tempSendBuffer
+U8 *received_data;       // the rest of a transfer read ahead for a host application
 U8 *vlx_command;         // kept for the layout of the reader; not used
 U8 *firmware_command;    // bytes the classifier took off the node (at most 80)
 U8 *tempSendBuffer;      // firmware_command bytes, then the read: the current chunk
@@ -301,7 +301,20 @@ void InitializeVars(void) {
     dataStart = 0;
 }
 
-S32 USBAdapter_ReadDataClassifier(U8 *buf) {
+namespace {
+
+// One transfer read whole at the start of a pass: the two classification
+// bytes and up to RX_BUFFER_SIZE behind them, what the two reads of the
+// classifier's bytes and of the data would have taken.
+constexpr size_t kFirstRead = RX_BUFFER_SIZE + 2;
+static_assert(TEMP_SEND_BUFFER_SIZE >= kFirstRead);
+
+// Waits for host data and reads up to `size` bytes into dst; the first two
+// (or the first and, when the transfer held one byte, the first of the next)
+// go to cls. The count of classification bytes (2, or 1 when nothing came
+// behind a single byte), -1 for none; *behind = bytes read behind the two.
+S32 readFirst(U8 *dst, size_t size, U8 *cls, S32 *behind) {
+    *behind = 0;
     const int64_t start = Wait_NowMs();
     const S32 period = slPollTimeout;
     short revents = 0;
@@ -317,13 +330,16 @@ S32 USBAdapter_ReadDataClassifier(U8 *buf) {
         fallBackAfterUelTimeout();
         return -1;
     }
-    ssize_t n = Wait_Read(fdPrn.load(), buf, 2, shouldPark);
+    ssize_t n = Wait_Read(fdPrn.load(), dst, size, shouldPark);
     int err = errno;
+    if (n > 2) *behind = static_cast<S32>(n - 2);
+    if (n > 2) n = 2;
+    if (n >= 1 && cls != dst) std::memcpy(cls, dst, static_cast<size_t>(n));
     if (n == 1) {
         // The host's transfer held one byte: the selector is in the next one.
-        if (pollPrn(slPollTimeout, &revents) > 0 && Wait_Read(fdPrn.load(), buf + 1, 1, shouldPark) == 1) n = 2;
+        if (pollPrn(slPollTimeout, &revents) > 0 && Wait_Read(fdPrn.load(), cls + 1, 1, shouldPark) == 1) n = 2;
     }
-    USBADP_LOG(DEBUG, "[USBAdp] slReadBytes: %ld, [%#x %#x]\n", static_cast<long>(n), buf[0], buf[1]);
+    USBADP_LOG(DEBUG, "[USBAdp] slReadBytes: %ld, [%#x %#x]\n", static_cast<long>(n), cls[0], cls[1]);
     if (n < 0) {
         if (err == EINTR) return -1;
         USBADP_LOG(ERROR, "[USBAdp] Error in read in ReadDataClassifier, errno: %d\n", err);
@@ -336,6 +352,13 @@ S32 USBAdapter_ReadDataClassifier(U8 *buf) {
         return -1;
     }
     return static_cast<S32>(n);
+}
+
+}  // namespace
+
+S32 USBAdapter_ReadDataClassifier(U8 *buf) {
+    S32 behind = 0;
+    return readFirst(buf, 2, buf, &behind);
 }
 
 S32 USBAdapter_AllocateReadBuffers(void) {
@@ -371,13 +394,18 @@ void USBAdapter_ReadPass(void) {
     S32 firmRes = 0;
     TUSBAdp_ParserID enParserID = enOther;
     bool readMore = false;
+    // Bytes of the transfer read behind the classification bytes, in place in
+    // tempSendBuffer; what the read of more data would have given.
+    S32 behind = 0;
     // The last chunk ended inside a UEL: what comes next is its rest, not a new
     // stream for the classifier. It is read at once, so a closing UEL cut after
     // its 7th or 8th byte ends the job without waiting for silence.
     const bool heldUel = startUELFlag == 1;
     if (heldUel) {
         readMore = true;
-    } else if (S32 got = USBAdapter_ReadDataClassifier(aubcommand); got == -1) {
+    } else if (S32 got = Wait_PutBackLeft(fdPrn.load()) > 0 ? USBAdapter_ReadDataClassifier(aubcommand)
+                                                                : readFirst(tempSendBuffer, kFirstRead, aubcommand, &behind);
+               got == -1) {
         // Parking ends an open job on the way out, not as a silence.
         if (!shouldPark()) onSilence(d);
         return;
@@ -388,6 +416,13 @@ void USBAdapter_ReadPass(void) {
         USBADP_LOG(INFO, "[USBAdp] firmRes: %ld, enParserID: %d\n", static_cast<long>(firmRes),
                    static_cast<int>(enParserID));
     } else {
+        if (behind > 0 && USBAdp_ParserOf(aubcommand) != enOther) {
+            // A host application reads the node itself: it finds the rest of
+            // the transfer there first.
+            std::memcpy(received_data, tempSendBuffer + 2, static_cast<size_t>(behind));
+            Wait_PutBack(fdPrn.load(), received_data, static_cast<size_t>(behind), behind + 2 == S32{kFirstRead});
+            behind = 0;
+        }
         S32 r = USBAdpater_StartDataClassifier(aubcommand, firmware_command, &firmRes, &enParserID);
         if (r == 0) {
             USBADP_LOG(INFO, "[USBAdp] Host appliction executed successfully\n");
@@ -408,7 +443,14 @@ void USBAdapter_ReadPass(void) {
     }
 
     S32 prn_read_ret = 0;
-    if (readMore) {
+    if (readMore && behind > 0) {
+        // Already here, straight behind the two classification bytes.
+        USBADP_LOG(DEBUG, "[USBAdp] PollTimeout -- 2: %d\n", slPollTimeout);
+        USBADP_LOG(DEBUG, "[USBAdp] slRet from poll: %d\n", 1);
+        USBADP_LOG(DEBUG, "[USBAdp]n revents in fd[0]: %d\n", POLLIN);
+        prn_read_ret = behind;
+        USBADP_LOG(DEBUG, "[USBAdp]Got the data with size[%d]\n", prn_read_ret);
+    } else if (readMore) {
         USBADP_LOG(DEBUG, "[USBAdp] PollTimeout -- 2: %d\n", slPollTimeout);
         const int64_t start = Wait_NowMs();
         const S32 period = slPollTimeout;
@@ -465,6 +507,9 @@ void USBAdapter_WakeReader(void) {
 
 void USBAdapter_EndJobOnPark(void) {
     const TPrintDelivery &d = USBPrint_Delivery();
+    // Transfer bytes not yet taken by a host application go the way of those
+    // still in the driver (lost with the cable, or with the close).
+    Wait_PutBack(-1, nullptr, 0, false);
     if (readFlag != 1) {
         // Held UEL bytes with no job: delivered as after silence, or they would
         // be taken for the start of whatever the host sends after re-plugging.

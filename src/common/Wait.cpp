@@ -4,7 +4,9 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <cerrno>
+#include <cstring>
 
 namespace {
 
@@ -17,7 +19,25 @@ int remaining(int64_t deadline) {
     return static_cast<int>(std::max<int64_t>(0, deadline - Wait_NowMs()));
 }
 
+// What Wait_PutBack left. Only the descriptor is looked at from other threads
+// (their reads of other descriptors pass by).
+std::atomic<int> backFd{-1};
+const char *backData;
+size_t backLeft;
+bool backMore;
+
+bool putBackOn(int fd) { return fd >= 0 && backFd.load(std::memory_order_relaxed) == fd; }
+
 }  // namespace
+
+void Wait_PutBack(int fd, const void *data, size_t size, bool more) {
+    backData = static_cast<const char *>(data);
+    backLeft = size;
+    backMore = more;
+    backFd.store(size > 0 ? fd : -1, std::memory_order_relaxed);
+}
+
+size_t Wait_PutBackLeft(int fd) { return putBackOn(fd) ? backLeft : 0; }
 
 int64_t Wait_NowMs() {
     // Deadlines are in milliseconds of seconds-long waits: the coarse clock is
@@ -28,6 +48,10 @@ int64_t Wait_NowMs() {
 }
 
 int Wait_PollIn(int fd, int timeoutMs, short *revents, WaitGoneFn gone, int wakeFd) {
+    if (putBackOn(fd)) {
+        if (revents) *revents = POLLIN;
+        return 1;
+    }
     const int64_t deadline = timeoutMs < 0 ? -1 : Wait_NowMs() + timeoutMs;
     int wait = timeoutMs;
     for (;;) {
@@ -55,6 +79,23 @@ int Wait_PollIn(int fd, int timeoutMs, short *revents, WaitGoneFn gone, int wake
 }
 
 ssize_t Wait_Read(int fd, void *buf, size_t size, WaitGoneFn gone) {
+    if (putBackOn(fd) && size > 0) {
+        const size_t n = std::min(size, backLeft);
+        std::memcpy(buf, backData, n);
+        backData += n;
+        backLeft -= n;
+        if (backLeft > 0) return static_cast<ssize_t>(n);
+        const bool more = backMore;
+        Wait_PutBack(-1, nullptr, 0, false);
+        // The transfer may go on behind what was put back: the rest of this
+        // read, if the node has it now.
+        pollfd p{fd, POLLIN, 0};
+        if (more && n < size && ::poll(&p, 1, 0) > 0 && (p.revents & POLLIN)) {
+            ssize_t r = Wait_Read(fd, static_cast<char *>(buf) + n, size - n, gone);
+            if (r > 0) return static_cast<ssize_t>(n) + r;
+        }
+        return static_cast<ssize_t>(n);
+    }
     for (;;) {
         ssize_t n = ::read(fd, buf, size);
         if (n >= 0 || errno != EINTR) return n;

@@ -30,6 +30,18 @@ int Wait_PollIn(int fd, int timeoutMs, short *revents, WaitGoneFn gone = nullptr
 // stop.
 ssize_t Wait_Read(int fd, void *buf, size_t size, WaitGoneFn gone = nullptr);
 
+// Bytes already taken off `fd` that belong in front of what it gives next (a
+// reader that took a whole transfer before it knew who the transfer is for).
+// Until they are used up, Wait_PollIn reports fd ready at once and Wait_Read
+// returns them first, at most as many as the one read of the node would have
+// given: with `more` (the read that took them was filled, so the transfer may
+// go on) a read that wants more than is left takes the rest from the node
+// when it has data at once. The bytes stay the caller's; one descriptor at a
+// time, used from its reader's thread only. Size 0 drops what is left.
+void Wait_PutBack(int fd, const void *data, size_t size, bool more);
+// Bytes put back on `fd` not yet read.
+size_t Wait_PutBackLeft(int fd);
+
 // A descriptor reporting any of these is ready again at once and gives
 // nothing (hung up, failed, closed).
 inline bool Wait_HungUp(short revents) { return (revents & (POLLHUP | POLLERR | POLLNVAL)) != 0; }

@@ -152,11 +152,10 @@ int main(int argc, char **argv) {
     char tmpl[] = "/tmp/usbadapter-bench-fw-XXXXXX";
     const char *dir = ::mkdtemp(tmpl);
     if (dir) std::filesystem::current_path(dir);
-    benchmark::Initialize(&argc, argv);
+    if (!RatioReporter::Initialize(&argc, argv, 9)) return 1;
     RatioReporter reporter;
     for (int size : {1 << 20, 16 << 20})
-        reporter.Compare("BM_FirmwareHandoff/" + std::to_string(size) + "/real_time",
-                         "BM_LoopbackTcp/" + std::to_string(size) + "/real_time");
+        reporter.Compare("BM_FirmwareHandoff/" + std::to_string(size), "BM_LoopbackTcp/" + std::to_string(size));
     benchmark::RunSpecifiedBenchmarks(&reporter);
     reporter.PrintRatios();
     if (dir) std::filesystem::remove_all(dir);

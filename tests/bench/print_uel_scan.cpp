@@ -66,8 +66,7 @@ BENCHMARK(BM_Memchr)->DenseRange(0, 2);
 int main(int argc, char **argv) {
     // CheckUELCommand logs a line per call: measure the search, not the terminal.
     setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
-    benchmark::Initialize(&argc, argv);
-    if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
+    if (!RatioReporter::Initialize(&argc, argv, 9)) return 1;
     RatioReporter reporter;
     for (int k = 0; k < 3; ++k)
         reporter.Compare("BM_CheckUEL/" + std::to_string(k), "BM_Memchr/" + std::to_string(k));

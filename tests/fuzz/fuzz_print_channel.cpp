@@ -40,6 +40,7 @@
 #include "adapter/Classifier.h"
 #include "adapter/USB.h"
 #include "adapter/prn_thread.h"
+#include "common/Wait.h"
 #include "maa/MAA_Address.h"
 #include "maa/MAA_Hook.h"
 #include "maa/MAA_IF.h"
@@ -303,6 +304,7 @@ void setUp() {
     IsConfigured = 1;  // the reader runs its turns only on a configured device
 
     InitializeVars();
+    Wait_PutBack(-1, nullptr, 0, false);
     slPollTimeout = POLL_TIMEOUT_IDLE;
     splitPatternMarker = 0;
     UelPosition = 0;
@@ -432,7 +434,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     for (size_t n = 0;; ++n) {
         CHECK(n <= limit, "the reader stopped taking host data");
         readerTurn();
-        if (vdev::PendingHostBytes(vdev::kPrn) > 0) continue;
+        if (vdev::PendingHostBytes(vdev::kPrn) > 0 || Wait_PutBackLeft(fdPrn) > 0) continue;
         bool more;
         {
             std::lock_guard lk(hostMu);
@@ -452,7 +454,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     for (int i = 0; i < 4 && (readFlag != 0 || startUELFlag != 0); ++i) readerTurn();
     CHECK(readFlag == 0 && startUELFlag == 0, "the reader is not idle after the host went quiet");
     CHECK(!java.jobOpen, "a job was never ended");
-    CHECK(vdev::PendingHostBytes(vdev::kPrn) == 0, "host bytes left unread");
+    CHECK(vdev::PendingHostBytes(vdev::kPrn) == 0 && Wait_PutBackLeft(fdPrn) == 0, "host bytes left unread");
 
     // Nothing is delivered that the host did not send, but a header read short
     // is passed on zero-padded: at most 14 bytes per ESC 0x91 header, 6 per

@@ -15,6 +15,7 @@
 #include "adapter/Classifier.h"
 #include "adapter/USB.h"
 #include "adapter/prn_thread.h"
+#include "common/Wait.h"
 #include "print/USBPrint.h"
 #include "vdev.h"
 
@@ -170,6 +171,7 @@ protected:
 
     static void ResetReader() {
         InitializeVars();
+        Wait_PutBack(-1, nullptr, 0, false);
         slPollTimeout = POLL_TIMEOUT_IDLE;
         splitPatternMarker = 0;
         UelPosition = 0;
@@ -177,7 +179,7 @@ protected:
 
     // Turns of the reader until every host byte has been taken (bounded).
     static void Drain() {
-        for (int turns = 0; vdev::PendingHostBytes(vdev::kPrn) > 0; ++turns) {
+        for (int turns = 0; vdev::PendingHostBytes(vdev::kPrn) > 0 || Wait_PutBackLeft(fdPrn) > 0; ++turns) {
             ASSERT_LT(turns, 100000) << "the reader stopped taking host data";
             USBAdapter_ReadPass();
         }

@@ -63,7 +63,7 @@ TEST_F(Framing, UelFramedJobInOneReadIsOneJobOfOnePass) {
     EXPECT_EQ(rec::Events()[1].data, job);
     EXPECT_EQ(rec::Events()[2].kind, rec::Kind::End);
     // Back to the short wait after the closing UEL.
-    EXPECT_EQ(vdev::PollTimeouts(vdev::kPrn), (std::vector<int>{5000, 5000, 5000}));
+    EXPECT_EQ(vdev::PollTimeouts(vdev::kPrn), (std::vector<int>{5000, 5000}));
     EXPECT_EQ(LoggerHost_Count("[USBAdp]NotifyEndOfData() called -- 4\n"), 1);
 }
 
@@ -75,7 +75,7 @@ TEST_F(Framing, OpenUelJobWaitsFiveMinutesAndSilenceEndsIt) {
     Silence();
     Silence();
     ExpectJobs({job});
-    EXPECT_EQ(vdev::PollTimeouts(vdev::kPrn), (std::vector<int>{5000, 5000, 300000, 5000}));
+    EXPECT_EQ(vdev::PollTimeouts(vdev::kPrn), (std::vector<int>{5000, 300000, 5000}));
     EXPECT_EQ(LoggerHost_Count("[USBAdp] Print channel poll timeout updated to 5sec\n"), 1);
     EXPECT_EQ(LoggerHost_Count("[USBAdp]NotifyEndOfData() called -- 2\n"), 1);
 }
@@ -115,7 +115,7 @@ TEST_F(Framing, ShortPjlPrefixIsDeliveredWithoutAFurtherRead) {
     vdev::HostWrite(vdev::kPrn, first);
     vdev::HostWrite(vdev::kPrn, "more data");
     USBAdapter_ReadPass();
-    EXPECT_EQ(vdev::ReadSizes(vdev::kPrn), (std::vector<size_t>{2, 78}));
+    EXPECT_EQ(vdev::ReadSizes(vdev::kPrn).size(), 1u);
     EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 9u);
     auto jobs = rec::Jobs();
     ASSERT_EQ(jobs.size(), 1u);
@@ -185,6 +185,44 @@ TEST_F(Framing, HostApplicationBetweenJobsIsNotPrintData) {
     auto apps = rec::Apps();
     ASSERT_EQ(apps.size(), 1u);
     EXPECT_EQ(apps[0].writes, (std::vector<std::string>{nd}));
+}
+
+// The reader takes a whole transfer at once; a host application that reads
+// the node itself must still find the transfer's rest there, in order, and
+// what it leaves is classified again, as if read from the node.
+TEST_F(Framing, ApplicationsReadTheRestOfTheirTransfer) {
+    auto header = [](char app, char len) { return std::string{'\x1b', '\x91', 0, 0, 0, 0, 0, app, 0, 0, 0, 0, 0, 0, 0, len}; };
+    const std::string nd = header(0x0D, 4), other = header(0x22, 0), big(3u << 19, 'b');
+    struct Row {
+        const char *what;
+        std::vector<std::string> transfers;
+        std::vector<std::string> appWrites;
+        std::string job;
+        std::vector<size_t> chunks;
+    } const rows[] = {
+        {"packet and print data in one transfer", {nd + "body" + "print"}, {nd, "body"}, "print", {5}},
+        {"body cut across transfers", {nd + "bo", "dy" + Framed("x")}, {nd, "body"}, Framed("x"), {19}},
+        {"unknown header is print data", {other + "data"}, {}, other + "data", {20}},
+        // Longer than one read of data: the first chunk is as long as before.
+        {"unknown header, transfer longer than a read", {other + big}, {}, other + big,
+         {16 + (1u << 20), big.size() - (1u << 20)}},
+    };
+    LoggerHost_StopCapture();
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.what);
+        rec::Clear();
+        ResetReader();
+        Send(r.transfers);
+        auto apps = rec::Apps();
+        ASSERT_EQ(apps.size(), r.appWrites.empty() ? 0u : 1u);
+        if (!apps.empty()) {
+            EXPECT_EQ(apps[0].writes, r.appWrites);
+        }
+        auto jobs = rec::Jobs();
+        ASSERT_EQ(jobs.size(), 1u);
+        EXPECT_TRUE(jobs[0].bytes == r.job);
+        EXPECT_EQ(jobs[0].chunks, r.chunks);
+    }
 }
 
 // ---- matrices: every cut ---------------------------------------------------
