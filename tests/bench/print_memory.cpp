@@ -6,7 +6,7 @@
 // taken after the first 64 MiB and then every 128 MiB; the figure is how far
 // it moved after the first sample. Not a ratio benchmark: a figure with its
 // check (exit status 1 when the job does not arrive whole or memory grew by
-// more than 8 MiB), run by ctest too.
+// more than 4 MiB), run by ctest too.
 #include <fcntl.h>
 #include <unistd.h>
 
@@ -119,7 +119,7 @@ int main() {
                 "growth %ld KiB\n",
                 static_cast<unsigned long long>(gSeen.bytes), whole ? "whole" : "NOT WHOLE", first, low, high,
                 high - first);
-    const bool flat = high - first <= 8 * 1024;
+    const bool flat = high - first <= 4 * 1024;
     if (!flat) std::printf("print_memory: resident memory grew with the job\n");
     std::fflush(nullptr);
     _exit(whole && flat ? 0 : 1);
