@@ -88,7 +88,7 @@ TEST_F(PrintReader, JavaExceptionInAChunkLeavesTheJobGoing) {
 }
 
 TEST_F(PrintReader, DaemonWithoutPrintCommandGetsNoJobAndTheReaderGoesOn) {
-    StartReader(fixtures::kDaemonWithoutPrintCommand);
+    StartReader(fixtures::kDaemonWithoutUpcalls);
     if (HasFatalFailure()) return;
     Send({"job data"});
     ASSERT_TRUE(WaitUntil([] { return LoggerHost_Count("[USBAdp] globalUSBPrintFileStreamObj == NULL\n") == 1; }));
