@@ -29,20 +29,6 @@ void ExpectJob(int job, const std::string &bytes) {
 
 using PrintReader = PrintJvmTest;
 
-TEST_F(PrintReader, UelFramedJobInOneReadIsOneJobOfOnePass) {
-    StartReader();
-    if (HasFatalFailure()) return;
-    const std::string job = Framed("@PJL ENTER LANGUAGE=PCL\r\n" + std::string(300, 'x'));
-    Send({job});
-    ExpectJob(0, job);
-    EXPECT_EQ(fixtures::JobFileName(0), "");
-    EXPECT_EQ(fixtures::JobChunkSizes(0), (std::vector<int>{static_cast<int>(job.size())}));
-    EXPECT_EQ(fixtures::Calls("processPrintCommand"), 1);
-    // The next wait for data is the short one again.
-    ASSERT_TRUE(WaitUntil([] { return vdev::PollTimeouts(vdev::kPrn).size() == 3; }));
-    EXPECT_EQ(vdev::PollTimeouts(vdev::kPrn), (std::vector<int>{5000, 5000, 5000}));
-}
-
 // Every cut of a UEL is covered by the reader's unit tests; here one cut shows
 // the held bytes reaching Java in the right job.
 TEST_F(PrintReader, UelCutAcrossTwoReadsIsJoined) {
@@ -52,6 +38,9 @@ TEST_F(PrintReader, UelCutAcrossTwoReadsIsJoined) {
     Send({kUel + page + kUel.substr(0, 4), kUel.substr(4) + Framed("second")});
     ExpectJob(0, Framed(page));
     ExpectJob(1, Framed("second"));
+    EXPECT_EQ(fixtures::JobFileName(0), "");
+    EXPECT_EQ(fixtures::JobChunkSizes(1), (std::vector<int>{static_cast<int>(Framed("second").size())}));
+    EXPECT_EQ(fixtures::Calls("processPrintCommand"), 2);
 }
 
 TEST_F(PrintReader, DcuNdAndFaxdReachJavaAndAnEmptyDcuIsRefused) {
