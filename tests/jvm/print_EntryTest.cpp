@@ -9,7 +9,6 @@
 
 namespace {
 
-using printjvm::kUel;
 using printjvm::ReadPrintMsg;
 
 const std::string kAlreadyRunning = "[USBAdp] readPrintMsg: the print reader is already running\n";

@@ -4,18 +4,14 @@
 // tests; here are the paths that need Java: its objects, its exceptions, its
 // missing methods, and a job too large for any buffer.
 #include <atomic>
-#include <cstring>
-#include <random>
 
 #include "print_Hidden.h"
 #include "print_Support.h"
+#include "support/RandomBytes.h"
 
 namespace {
 
 using printjvm::AwaitJobBytes;
-using printjvm::kUel;
-
-std::string Framed(const std::string &payload) { return kUel + payload + kUel; }
 
 void Send(const std::vector<std::string> &transfers) {
     for (const std::string &t : transfers) vdev::HostWrite(vdev::kPrn, t);
@@ -175,13 +171,7 @@ TEST_F(PrintReader, FortyMebibyteJobInMebibyteTransfersArrivesWhole) {
     StartReader();
     if (HasFatalFailure()) return;
     LoggerHost_StopCapture();
-    std::mt19937_64 rng(1234);
-    std::string body((40u << 20) - 2 * kUel.size(), '\0');
-    for (size_t i = 0; i + 8 <= body.size(); i += 8) {
-        uint64_t v = rng();
-        std::memcpy(&body[i], &v, 8);
-    }
-    const std::string stream = Framed(body);
+    const std::string stream = Framed(RandomBytes((40u << 20) - 2 * kUel.size(), 1234));
     std::string sent;
     for (size_t at = 0; at < stream.size(); at += 1u << 20) {
         std::string t = stream.substr(at, 1u << 20);
