@@ -28,7 +28,9 @@ struct Upcalls {
                fetchPrinterStatus && getInterpreters;
     }
 
-    void Pass(std::string bytes) const { PassData(reinterpret_cast<U8 *>(bytes.data()), static_cast<S32>(bytes.size())); }
+    void Pass(std::string bytes) const {
+        PassData(reinterpret_cast<U8 *>(bytes.data()), static_cast<S32>(bytes.size()));
+    }
     S32 AppBuf(const char *type, std::string bytes) const {
         return SendAppBuf(type, reinterpret_cast<U8 *>(bytes.data()), static_cast<S32>(bytes.size()));
     }

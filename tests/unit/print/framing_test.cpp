@@ -2,6 +2,7 @@
 // would get. The first rule everywhere: every byte the host sent as print data
 // is passed exactly once, in order.
 #include <chrono>
+#include <functional>
 #include <random>
 #include <string>
 #include <vector>
@@ -10,8 +11,6 @@
 #include "support/RandomBytes.h"
 
 namespace {
-
-using Framing = ReaderTest;
 
 // Host data the classifier must not take for an application: escapes are
 // followed only by '%', another escape or 'E'; partial and spoiled UELs included.
@@ -49,6 +48,23 @@ void ExpectJobs(const std::vector<std::string> &expected) {
         EXPECT_TRUE(jobs[i].ended) << "job " << i;
     }
 }
+
+class Framing : public ReaderTest {
+protected:
+    // `stream` cut into two and three transfers at every pair of cuts (the second
+    // one every `step` bytes), each sent to a fresh reader and then `check`ed.
+    static void EveryCut(const std::string &stream, size_t step, const std::function<void()> &check) {
+        for (size_t c1 = 1; c1 < stream.size(); ++c1) {
+            for (size_t c2 = c1; c2 < stream.size(); c2 += step) {
+                SCOPED_TRACE(testing::Message() << "stream of " << stream.size() << ", cuts " << c1 << ", " << c2);
+                Restart();
+                Send(c1 == c2 ? CutAt(stream, {c1}) : CutAt(stream, {c1, c2}));
+                check();
+                if (HasFailure()) return;
+            }
+        }
+    }
+};
 
 // ---- single cases ----------------------------------------------------------
 
@@ -201,15 +217,7 @@ TEST_F(Framing, FramedJobsSurviveEveryCutIntoTwoAndThreeTransfers) {
         stream += expected.back();
     }
     LoggerHost_StopCapture();
-    for (size_t c1 = 1; c1 < stream.size(); ++c1) {
-        for (size_t c2 = c1; c2 < stream.size(); ++c2) {
-            SCOPED_TRACE(testing::Message() << "cuts " << c1 << ", " << c2);
-            Restart();
-            Send(c1 == c2 ? CutAt(stream, {c1}) : CutAt(stream, {c1, c2}));
-            ExpectJobs(expected);
-            if (HasFailure()) return;
-        }
-    }
+    EveryCut(stream, 1, [&] { ExpectJobs(expected); });
 }
 
 TEST_F(Framing, LooseStreamsPassEveryByteOnceWhereverTheyAreCut) {
@@ -221,16 +229,11 @@ TEST_F(Framing, LooseStreamsPassEveryByteOnceWhereverTheyAreCut) {
     };
     LoggerHost_StopCapture();
     for (const std::string &stream : streams) {
-        for (size_t c1 = 1; c1 < stream.size(); ++c1) {
-            for (size_t c2 = c1; c2 < stream.size(); c2 += 3) {
-                SCOPED_TRACE(testing::Message() << "stream of " << stream.size() << ", cuts " << c1 << ", " << c2);
-                Restart();
-                Send(c1 == c2 ? CutAt(stream, {c1}) : CutAt(stream, {c1, c2}));
-                EXPECT_EQ(rec::Delivered(), stream);
-                for (const rec::Job &j : rec::Jobs()) EXPECT_TRUE(j.ended);
-                if (HasFailure()) return;
-            }
-        }
+        EveryCut(stream, 3, [&] {
+            EXPECT_EQ(rec::Delivered(), stream);
+            for (const rec::Job &j : rec::Jobs()) EXPECT_TRUE(j.ended);
+        });
+        if (HasFailure()) return;
     }
 }
 
