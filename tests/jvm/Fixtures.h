@@ -16,9 +16,6 @@ namespace fixtures {
 // Every call-back, recorded.
 inline constexpr const char *kRecordingDaemon =
     "com/tarnwel/vbk/ca/plugin/usbadapter/print/fixtures/RecordingPrintDaemon";
-// Every call-back but "processPrintCommand".
-inline constexpr const char *kDaemonWithoutPrintCommand =
-    "com/tarnwel/vbk/ca/plugin/usbadapter/print/fixtures/DaemonWithoutPrintCommand";
 // No call-back at all.
 inline constexpr const char *kDaemonWithoutUpcalls =
     "com/tarnwel/vbk/ca/plugin/usbadapter/print/fixtures/DaemonWithoutUpcalls";

@@ -9,7 +9,6 @@
 
 namespace {
 
-using printjvm::kUel;
 using printjvm::ReadPrintMsg;
 
 const std::string kAlreadyRunning = "[USBAdp] readPrintMsg: the print reader is already running\n";
@@ -48,31 +47,35 @@ bool Collected(const Tracked &t) {
 
 using PrintEntry = PrintJvmTest;
 
+// Each failed call lets its daemon go at once (a later one finds none to
+// delete) and keeps its MAA object for the shell.
 TEST_F(PrintEntry, MissingStringReleasesTheDaemonAndReturns) {
-    Tracked daemon = Make(fixtures::kRecordingDaemon), maa = Make(fixtures::kRecordingMaa);
-    jvm::RunOnThread([&](JNIEnv *env) { ReadPrintMsg(env, daemon.global, maa.global, "Tarnwel", "TW-4020", nullptr); },
-                     "print-entry");
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] GetStringUTFChars[p_deviceClassName] returns NULL\n"), 1);
+    const struct {
+        const char *manufacturer, *model, *deviceClass, *named;
+    } rows[] = {
+        {nullptr, "TW", "printer", "p_manufacturingString"},
+        {"Tarnwel", nullptr, "printer", "p_modelName"},
+        {"Tarnwel", "TW-4020", nullptr, "p_deviceClassName"},
+    };
+    for (const auto &r : rows) {
+        SCOPED_TRACE(r.named);
+        Tracked daemon = Make(fixtures::kRecordingDaemon), maa = Make(fixtures::kRecordingMaa);
+        jvm::RunOnThread(
+            [&](JNIEnv *env) { ReadPrintMsg(env, daemon.global, maa.global, r.manufacturer, r.model, r.deviceClass); },
+            "print-entry");
+        EXPECT_EQ(LoggerHost_Count("[USBAdp] GetStringUTFChars[" + std::string(r.named) + "] returns NULL\n"), 1);
+        Drop(daemon);
+        Drop(maa);
+        EXPECT_TRUE(Collected(daemon)) << "the daemon is still held after a failed entry";
+        EXPECT_FALSE(Collected(maa)) << "the MAA object is kept for the shell";
+    }
     EXPECT_FALSE(LoggerHost_Contains("[USBAdp]Inside USBAdapter_IF_PrintFunction"));
-    Drop(daemon);
-    Drop(maa);
-    EXPECT_TRUE(Collected(daemon)) << "the daemon is still held after a failed entry";
-    EXPECT_FALSE(Collected(maa)) << "the MAA object is kept for the shell";
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] Deleting Global reference of print\n"), 0);
     // Without a daemon the queries answer from the library alone.
     auto fetch = hidden::Function<U32()>("fetchPrinterStatus()");
     ASSERT_NE(fetch, nullptr);
     EXPECT_EQ(fetch(), 0u);
     EXPECT_EQ(LoggerHost_Count("[USBAdp][USBPrint]Error: globalPrintObj is null.\n"), 1);
-}
-
-TEST_F(PrintEntry, EachNullStringIsNamed) {
-    Tracked d = Make(fixtures::kRecordingDaemon);
-    jvm::RunOnThread([&](JNIEnv *env) { ReadPrintMsg(env, d.global, nullptr, nullptr, "TW", "printer"); }, "e1");
-    jvm::RunOnThread([&](JNIEnv *env) { ReadPrintMsg(env, d.global, nullptr, "Tarnwel", nullptr, "printer"); }, "e2");
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] GetStringUTFChars[p_manufacturingString] returns NULL\n"), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] GetStringUTFChars[p_modelName] returns NULL\n"), 1);
-    // The first call's daemon was released, so the second finds none to delete.
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] Deleting Global reference of print\n"), 0);
 }
 
 TEST_F(PrintEntry, CallAfterAFailedOneReleasesItsMaaObjectAndStartsTheReader) {
@@ -137,6 +140,7 @@ TEST_F(PrintEntry, CallWhileTheReaderRunsIsRefusedAndTheReaderKeepsItsObjects) {
     const int asked = fixtures::Calls("getPrinterStatus");
     EXPECT_EQ(fetch(), 2u);
     EXPECT_EQ(fixtures::Calls("getPrinterStatus"), asked + 1);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp][USBPrint]Exit fetchPrinterStatus, printerStatus[2]\n"), 1);
 }
 
 }  // namespace

@@ -2,14 +2,12 @@
 
 #include <cxxabi.h>
 #include <elf.h>
-#include <fcntl.h>
 #include <link.h>
-#include <sys/mman.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <cstdlib>
 #include <cstring>
+#include <fstream>
+#include <iterator>
 #include <map>
 #include <mutex>
 #include <string>
@@ -17,43 +15,31 @@
 namespace hidden {
 namespace {
 
-struct Library {
-    std::string path;
-    ElfW(Addr) base = 0;
-};
-
-int FindLibrary(dl_phdr_info *info, size_t, void *data) {
-    auto *lib = static_cast<Library *>(data);
-    if (info->dlpi_name && std::strstr(info->dlpi_name, "libusbadapter.so")) {
-        lib->path = info->dlpi_name;
-        lib->base = info->dlpi_addr;
-        return 1;
-    }
-    return 0;
-}
-
 // Every function and data symbol of the library, by demangled name.
 std::map<std::string, void *> ReadSymbols() {
+    struct Library {
+        std::string path;
+        ElfW(Addr) base = 0;
+    } lib;
+    dl_iterate_phdr(
+        [](dl_phdr_info *info, size_t, void *data) {
+            if (!info->dlpi_name || !std::strstr(info->dlpi_name, "libusbadapter.so")) return 0;
+            *static_cast<Library *>(data) = {info->dlpi_name, info->dlpi_addr};
+            return 1;
+        },
+        &lib);
     std::map<std::string, void *> out;
-    Library lib;
-    dl_iterate_phdr(FindLibrary, &lib);
-    if (lib.path.empty()) return out;
-    int fd = ::open(lib.path.c_str(), O_RDONLY);
-    if (fd < 0) return out;
-    struct stat st {};
-    ::fstat(fd, &st);
-    void *map = ::mmap(nullptr, static_cast<size_t>(st.st_size), PROT_READ, MAP_PRIVATE, fd, 0);
-    ::close(fd);
-    if (map == MAP_FAILED) return out;
-    const auto *bytes = static_cast<const unsigned char *>(map);
+    std::ifstream in(lib.path, std::ios::binary);
+    const std::string file{std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
+    if (file.size() < sizeof(ElfW(Ehdr))) return out;
+    const auto *bytes = reinterpret_cast<const unsigned char *>(file.data());
     const auto *eh = reinterpret_cast<const ElfW(Ehdr) *>(bytes);
     const auto *sh = reinterpret_cast<const ElfW(Shdr) *>(bytes + eh->e_shoff);
     for (int i = 0; i < eh->e_shnum; ++i) {
         if (sh[i].sh_type != SHT_SYMTAB) continue;
         const auto *syms = reinterpret_cast<const ElfW(Sym) *>(bytes + sh[i].sh_offset);
         const char *names = reinterpret_cast<const char *>(bytes + sh[sh[i].sh_link].sh_offset);
-        size_t count = sh[i].sh_size / sizeof(ElfW(Sym));
-        for (size_t s = 0; s < count; ++s) {
+        for (size_t s = 0; s < sh[i].sh_size / sizeof(ElfW(Sym)); ++s) {
             int type = ELF64_ST_TYPE(syms[s].st_info);
             if ((type != STT_FUNC && type != STT_OBJECT) || syms[s].st_value == 0) continue;
             const char *mangled = names + syms[s].st_name;
@@ -63,12 +49,10 @@ std::map<std::string, void *> ReadSymbols() {
             std::free(plain);
         }
     }
-    ::munmap(map, static_cast<size_t>(st.st_size));
     return out;
 }
 
 }  // namespace
-
 void *Find(const char *name) {
     static std::mutex mu;
     static std::map<std::string, void *> symbols;

@@ -4,18 +4,14 @@
 // tests; here are the paths that need Java: its objects, its exceptions, its
 // missing methods, and a job too large for any buffer.
 #include <atomic>
-#include <cstring>
-#include <random>
 
 #include "print_Hidden.h"
 #include "print_Support.h"
+#include "support/RandomBytes.h"
 
 namespace {
 
 using printjvm::AwaitJobBytes;
-using printjvm::kUel;
-
-std::string Framed(const std::string &payload) { return kUel + payload + kUel; }
 
 void Send(const std::vector<std::string> &transfers) {
     for (const std::string &t : transfers) vdev::HostWrite(vdev::kPrn, t);
@@ -29,20 +25,6 @@ void ExpectJob(int job, const std::string &bytes) {
 
 using PrintReader = PrintJvmTest;
 
-TEST_F(PrintReader, UelFramedJobInOneReadIsOneJobOfOnePass) {
-    StartReader();
-    if (HasFatalFailure()) return;
-    const std::string job = Framed("@PJL ENTER LANGUAGE=PCL\r\n" + std::string(300, 'x'));
-    Send({job});
-    ExpectJob(0, job);
-    EXPECT_EQ(fixtures::JobFileName(0), "");
-    EXPECT_EQ(fixtures::JobChunkSizes(0), (std::vector<int>{static_cast<int>(job.size())}));
-    EXPECT_EQ(fixtures::Calls("processPrintCommand"), 1);
-    // The next wait for data is the short one again.
-    ASSERT_TRUE(WaitUntil([] { return vdev::PollTimeouts(vdev::kPrn).size() == 2; }));
-    EXPECT_EQ(vdev::PollTimeouts(vdev::kPrn), (std::vector<int>{5000, 5000}));
-}
-
 // Every cut of a UEL is covered by the reader's unit tests; here one cut shows
 // the held bytes reaching Java in the right job.
 TEST_F(PrintReader, UelCutAcrossTwoReadsIsJoined) {
@@ -52,6 +34,9 @@ TEST_F(PrintReader, UelCutAcrossTwoReadsIsJoined) {
     Send({kUel + page + kUel.substr(0, 4), kUel.substr(4) + Framed("second")});
     ExpectJob(0, Framed(page));
     ExpectJob(1, Framed("second"));
+    EXPECT_EQ(fixtures::JobFileName(0), "");
+    EXPECT_EQ(fixtures::JobChunkSizes(1), (std::vector<int>{static_cast<int>(Framed("second").size())}));
+    EXPECT_EQ(fixtures::Calls("processPrintCommand"), 2);
 }
 
 TEST_F(PrintReader, DcuNdAndFaxdReachJavaAndAnEmptyDcuIsRefused) {
@@ -88,7 +73,7 @@ TEST_F(PrintReader, JavaExceptionInAChunkLeavesTheJobGoing) {
 }
 
 TEST_F(PrintReader, DaemonWithoutPrintCommandGetsNoJobAndTheReaderGoesOn) {
-    StartReader(fixtures::kDaemonWithoutPrintCommand);
+    StartReader(fixtures::kDaemonWithoutUpcalls);
     if (HasFatalFailure()) return;
     Send({"job data"});
     ASSERT_TRUE(WaitUntil([] { return LoggerHost_Count("[USBAdp] globalUSBPrintFileStreamObj == NULL\n") == 1; }));
@@ -186,13 +171,7 @@ TEST_F(PrintReader, FortyMebibyteJobInMebibyteTransfersArrivesWhole) {
     StartReader();
     if (HasFatalFailure()) return;
     LoggerHost_StopCapture();
-    std::mt19937_64 rng(1234);
-    std::string body((40u << 20) - 2 * kUel.size(), '\0');
-    for (size_t i = 0; i + 8 <= body.size(); i += 8) {
-        uint64_t v = rng();
-        std::memcpy(&body[i], &v, 8);
-    }
-    const std::string stream = Framed(body);
+    const std::string stream = Framed(RandomBytes((40u << 20) - 2 * kUel.size(), 1234));
     std::string sent;
     for (size_t at = 0; at < stream.size(); at += 1u << 20) {
         std::string t = stream.substr(at, 1u << 20);

@@ -19,13 +19,14 @@
 #include "LoggerHost.h"
 #include "support/MsgQueue.h"
 #include "support/TempRoot.h"
+#include "support/Uel.h"
 #include "support/WaitUntil.h"
 #include "usbadapter/mfpbridge.h"
 #include "vdev.h"
 
 namespace printjvm {
 
-inline const std::string kUel = "\x1b%-12345X";
+using ::kUel;
 inline constexpr const char *kReadPrintMsgSig =
     "(Ljava/lang/Object;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;I)V";
 

@@ -2,7 +2,7 @@
 // its reader waits for the initialisation message, against the recording
 // daemons: what Java sees, what comes back, and that no Java failure leaves an
 // exception pending.
-#include <cstring>
+#include <optional>
 #include <thread>
 
 #include "print_Hidden.h"
@@ -10,33 +10,36 @@
 
 namespace {
 
-// Looked up once the library is loaded (Java loads it with the first service class).
+// Looked up on construction, once the library is loaded (Java loads it with
+// the first service class).
 struct Upcalls {
-    S8 (*RegisterJob)(const char *) = nullptr;
-    void (*PassData)(U8 *, S32) = nullptr;
-    void (*NotifyEndOfData)() = nullptr;
-    S32 (*SendAppType)(const char *) = nullptr;
-    S32 (*SendAppBuf)(const char *, U8 *, S32) = nullptr;
-    S32 (*NotifyAppEnd)(const char *) = nullptr;
-    U32 (*fetchPrinterStatus)() = nullptr;
-    void (*getInterpreters)(U32 *) = nullptr;
+    S8 (*RegisterJob)(const char *) = hidden::Function<S8(const char *)>("RegisterJob(char const*)");
+    void (*PassData)(U8 *, S32) = hidden::Function<void(U8 *, S32)>("PassData(unsigned char*, int)");
+    void (*NotifyEndOfData)() = hidden::Function<void()>("NotifyEndOfData()");
+    S32 (*SendAppType)(const char *) = hidden::Function<S32(const char *)>("SendAppType(char const*)");
+    S32 (*SendAppBuf)(const char *, U8 *, S32) =
+        hidden::Function<S32(const char *, U8 *, S32)>("SendAppBuf(char const*, unsigned char*, int)");
+    S32 (*NotifyAppEnd)(const char *) = hidden::Function<S32(const char *)>("NotifyAppEnd(char const*)");
+    U32 (*fetchPrinterStatus)() = hidden::Function<U32()>("fetchPrinterStatus()");
+    void (*getInterpreters)(U32 *) = hidden::Function<void(U32 *)>("getInterpreters(unsigned int*)");
 
-    bool Load() {
-        RegisterJob = hidden::Function<S8(const char *)>("RegisterJob(char const*)");
-        PassData = hidden::Function<void(U8 *, S32)>("PassData(unsigned char*, int)");
-        NotifyEndOfData = hidden::Function<void()>("NotifyEndOfData()");
-        SendAppType = hidden::Function<S32(const char *)>("SendAppType(char const*)");
-        SendAppBuf = hidden::Function<S32(const char *, U8 *, S32)>("SendAppBuf(char const*, unsigned char*, int)");
-        NotifyAppEnd = hidden::Function<S32(const char *)>("NotifyAppEnd(char const*)");
-        fetchPrinterStatus = hidden::Function<U32()>("fetchPrinterStatus()");
-        getInterpreters = hidden::Function<void(U32 *)>("getInterpreters(unsigned int*)");
+    bool Loaded() const {
         return RegisterJob && PassData && NotifyEndOfData && SendAppType && SendAppBuf && NotifyAppEnd &&
                fetchPrinterStatus && getInterpreters;
     }
 
-    void Pass(std::string bytes) const { PassData(reinterpret_cast<U8 *>(bytes.data()), static_cast<S32>(bytes.size())); }
+    void Pass(std::string bytes) const {
+        PassData(reinterpret_cast<U8 *>(bytes.data()), static_cast<S32>(bytes.size()));
+    }
     S32 AppBuf(const char *type, std::string bytes) const {
         return SendAppBuf(type, reinterpret_cast<U8 *>(bytes.data()), static_cast<S32>(bytes.size()));
+    }
+    // What getInterpreters writes into 17 words with Java answering `given`.
+    std::vector<U32> Interpreters(const std::vector<int> &given) const {
+        fixtures::SetInterpreters(given);
+        std::vector<U32> ids(17, 0xABABABABu);
+        getInterpreters(ids.data());
+        return ids;
     }
 };
 
@@ -46,60 +49,56 @@ protected:
     // leaves the library to the test thread.
     void Start(const char *daemonClass = fixtures::kRecordingDaemon) {
         StartReader(daemonClass, false);
-        ASSERT_TRUE(up.Load());
+        if (HasFatalFailure()) return;
+        ASSERT_TRUE(up.emplace().Loaded());
         LoggerHost_StartCapture();
     }
     static bool ExceptionPending() { return jvm::Env()->ExceptionCheck() == JNI_TRUE; }
 
-    Upcalls up;
+    std::optional<Upcalls> up;
 };
 
 TEST_F(PrintUpcalls, JobUpcallsReachTheHandlerInOrder) {
     Start();
     if (HasFatalFailure()) return;
-    EXPECT_EQ(up.RegisterJob("job.prn"), 1);
-    up.Pass("hello");
-    up.Pass("");
-    up.NotifyEndOfData();
+    // Before any job, data and end are logged and dropped.
+    up->Pass("orphan");
+    up->NotifyEndOfData();
+    EXPECT_EQ(fixtures::Events(), "");
+    EXPECT_EQ(up->RegisterJob("job.prn"), 1);
+    up->Pass("hello");
+    up->Pass("");
+    up->NotifyEndOfData();
     EXPECT_EQ(fixtures::EventLines(), (std::vector<std::string>{"processPrintCommand:job.prn", "addBufferToList:0:5",
                                                                 "addBufferToList:0:0", "endOfData:0"}));
     EXPECT_EQ(fixtures::JobBytes(0), "hello");
     EXPECT_EQ(fixtures::JobChunkSizes(0), (std::vector<int>{5, 0}));
     // The handler is gone with the end of the job.
-    up.NotifyEndOfData();
-    up.Pass("late");
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] globalUSBPrintFileStreamObj == NULL\n"), 2);
+    up->NotifyEndOfData();
+    up->Pass("late");
+    EXPECT_EQ(LoggerHost_Count("[USBAdp] globalUSBPrintFileStreamObj == NULL\n"), 4);
     EXPECT_EQ(fixtures::Calls("addBufferToList"), 2);
-}
-
-TEST_F(PrintUpcalls, DataAndEndBeforeAnyJobAreLoggedAndDropped) {
-    Start();
-    if (HasFatalFailure()) return;
-    up.Pass("orphan");
-    up.NotifyEndOfData();
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] globalUSBPrintFileStreamObj == NULL\n"), 2);
-    EXPECT_EQ(fixtures::Events(), "");
 }
 
 TEST_F(PrintUpcalls, NullHandlerAnswersMinusOne) {
     Start();
     if (HasFatalFailure()) return;
     fixtures::ReturnNull("processPrintCommand");
-    EXPECT_EQ(up.RegisterJob(""), -1);
+    EXPECT_EQ(up->RegisterJob(""), -1);
     EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in RegisterJob()::globalUSBPrintFileStreamObj object is null.\n"), 1);
     fixtures::ReturnNull("processPrintCommand", false);
     fixtures::ThrowOn("processPrintCommand", 1);
-    EXPECT_EQ(up.RegisterJob(""), -1);
+    EXPECT_EQ(up->RegisterJob(""), -1);
     EXPECT_FALSE(ExceptionPending());
 }
 
 TEST_F(PrintUpcalls, NewJobReplacesAHandlerLeftOpen) {
     Start();
     if (HasFatalFailure()) return;
-    up.RegisterJob("a");
-    up.RegisterJob("b");
-    up.Pass("data");
-    up.NotifyEndOfData();
+    up->RegisterJob("a");
+    up->RegisterJob("b");
+    up->Pass("data");
+    up->NotifyEndOfData();
     ASSERT_EQ(fixtures::JobCount(), 2);
     EXPECT_EQ(fixtures::JobByteCount(0), 0);
     EXPECT_FALSE(fixtures::JobEnded(0));
@@ -110,18 +109,18 @@ TEST_F(PrintUpcalls, NewJobReplacesAHandlerLeftOpen) {
 TEST_F(PrintUpcalls, ApplicationTransferIsTypeBuffersAndClose) {
     Start();
     if (HasFatalFailure()) return;
-    EXPECT_EQ(up.SendAppType("faxd"), 0);
-    EXPECT_EQ(up.AppBuf("faxd", std::string("\x1b\x91\0\x01", 4)), 0);
-    EXPECT_EQ(up.AppBuf("faxd", "body"), 0);
-    EXPECT_EQ(up.NotifyAppEnd("faxd"), 0);
+    EXPECT_EQ(up->SendAppType("faxd"), 0);
+    EXPECT_EQ(up->AppBuf("faxd", std::string("\x1b\x91\0\x01", 4)), 0);
+    EXPECT_EQ(up->AppBuf("faxd", "body"), 0);
+    EXPECT_EQ(up->NotifyAppEnd("faxd"), 0);
     ASSERT_EQ(fixtures::AppCount(), 1);
     EXPECT_EQ(fixtures::AppType(0), "faxd");
     EXPECT_EQ(fixtures::AppBytes(0), std::string("\x1b\x91\0\x01", 4) + "body");
     EXPECT_EQ(fixtures::AppWriteCount(0), 2);
     EXPECT_TRUE(fixtures::AppClosed(0));
     // The stream is gone after the close.
-    EXPECT_EQ(up.AppBuf("faxd", "more"), -1);
-    EXPECT_EQ(up.NotifyAppEnd("faxd"), -1);
+    EXPECT_EQ(up->AppBuf("faxd", "more"), -1);
+    EXPECT_EQ(up->NotifyAppEnd("faxd"), -1);
     EXPECT_EQ(LoggerHost_Count("[USBAdp] can't find clsUSBAppStream\n"), 2);
 }
 
@@ -129,63 +128,42 @@ TEST_F(PrintUpcalls, ApplicationTransferFailuresAnswerMinusOne) {
     Start();
     if (HasFatalFailure()) return;
     fixtures::ReturnNull("processData");
-    EXPECT_EQ(up.SendAppType("dcu"), -1);
+    EXPECT_EQ(up->SendAppType("dcu"), -1);
     EXPECT_EQ(LoggerHost_Count("[USBAdp] globalUSBAppStreamobj is NULL\n"), 1);
     fixtures::ReturnNull("processData", false);
 
-    ASSERT_EQ(up.SendAppType("dcu"), 0);
+    ASSERT_EQ(up->SendAppType("dcu"), 0);
     fixtures::ThrowOn("write", 1);
-    EXPECT_EQ(up.AppBuf("dcu", "lost"), 0);  // a throwing write is swept, not a failure
+    EXPECT_EQ(up->AppBuf("dcu", "lost"), 0);  // a throwing write is swept, not a failure
     EXPECT_FALSE(ExceptionPending());
-    EXPECT_EQ(up.AppBuf("dcu", "kept"), 0);
-    EXPECT_EQ(up.NotifyAppEnd("dcu"), 0);
+    EXPECT_EQ(up->AppBuf("dcu", "kept"), 0);
+    EXPECT_EQ(up->NotifyAppEnd("dcu"), 0);
     EXPECT_EQ(fixtures::AppBytes(0), "kept");
 }
 
 TEST_F(PrintUpcalls, DaemonWithoutCallBacksFailsCleanly) {
     Start(fixtures::kDaemonWithoutUpcalls);
     if (HasFatalFailure()) return;
-    EXPECT_EQ(up.SendAppType("ampv"), -1);
+    EXPECT_EQ(up->SendAppType("ampv"), -1);
     EXPECT_EQ(LoggerHost_Count("[USBAdp] can't find processData method\n"), 1);
-    EXPECT_EQ(up.fetchPrinterStatus(), 0u);
+    EXPECT_EQ(up->fetchPrinterStatus(), 0u);
     EXPECT_EQ(LoggerHost_Count("[USBAdp][USBPrint] GetMethodID returned NULL in fetchPrinterStatus()\n"), 1);
-    U32 ids[15];
-    std::memset(ids, 0xAB, sizeof ids);
-    up.getInterpreters(ids);
-    for (U32 id : ids) EXPECT_EQ(id, 0xABABABABu);
+    EXPECT_EQ(up->Interpreters({1, 2}), std::vector<U32>(17, 0xABABABABu));
     EXPECT_FALSE(ExceptionPending());
-}
-
-TEST_F(PrintUpcalls, PrinterStatusComesFromTheDaemon) {
-    Start();
-    if (HasFatalFailure()) return;
-    fixtures::SetPrinterStatus(2);
-    EXPECT_EQ(up.fetchPrinterStatus(), 2u);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp][USBPrint]Exit fetchPrinterStatus, printerStatus[2]\n"), 1);
-    EXPECT_EQ(fixtures::Calls("getPrinterStatus"), 1);
 }
 
 TEST_F(PrintUpcalls, InterpretersAreAlwaysFifteenEntries) {
     Start();
     if (HasFatalFailure()) return;
+    const U32 untouched = 0xABABABABu;
     std::vector<int> twenty;
-    for (int i = 1; i <= 20; ++i) twenty.push_back(100 + i);
-    fixtures::SetInterpreters(twenty);
-    U32 ids[17];
-    std::memset(ids, 0xAB, sizeof ids);
-    up.getInterpreters(ids);
-    for (int i = 0; i < 15; ++i) EXPECT_EQ(ids[i], static_cast<U32>(101 + i)) << i;
-    EXPECT_EQ(ids[15], 0xABABABABu);
-    EXPECT_EQ(ids[16], 0xABABABABu);
-
+    std::vector<U32> first15(17, untouched);
+    for (int i = 0; i < 20; ++i) twenty.push_back(101 + i);
+    for (int i = 0; i < 15; ++i) first15[i] = 101 + i;
+    EXPECT_EQ(up->Interpreters(twenty), first15);
     // A short Java array still gives 15 entries, the missing ones 0.
-    fixtures::SetInterpreters({7, 8, 9});
-    std::memset(ids, 0xAB, sizeof ids);
-    up.getInterpreters(ids);
-    EXPECT_EQ(ids[0], 7u);
-    EXPECT_EQ(ids[2], 9u);
-    for (int i = 3; i < 15; ++i) EXPECT_EQ(ids[i], 0u) << i;
-    EXPECT_EQ(ids[15], 0xABABABABu);
+    EXPECT_EQ(up->Interpreters({7, 8, 9}), (std::vector<U32>{7, 8, 9, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, untouched,
+                                                              untouched}));
     EXPECT_FALSE(ExceptionPending());
 }
 
@@ -193,9 +171,9 @@ TEST_F(PrintUpcalls, NativeThreadOfItsOwnAttachesForItsUpcalls) {
     Start();
     if (HasFatalFailure()) return;
     std::thread native([this] {
-        up.RegisterJob("from a native thread");
-        up.Pass("bytes");
-        up.NotifyEndOfData();
+        up->RegisterJob("from a native thread");
+        up->Pass("bytes");
+        up->NotifyEndOfData();
         jvm::Vm()->DetachCurrentThread();
     });
     native.join();

@@ -18,9 +18,7 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <mutex>
-#include <random>
-#include <sstream>
+#include <iterator>
 #include <string>
 #include <thread>
 #include <vector>
@@ -32,27 +30,17 @@
 #include "firmware/FirmWareUpdate.h"
 #include "firmware/UpdateManager.h"
 #include "FwPack.h"
+#include "support/RandomBytes.h"
 #include "vdev.h"
 
 namespace fwtest {
 
-inline const std::string kHeaderText = fwpack::kHeaderText;
-
 // The 80-byte header a host puts in front of an image.
-inline std::string Header(const std::string &id, uint32_t size) { return fwpack::Header(id, size); }
-
-inline std::string Body(size_t n, unsigned seed) {
-    std::mt19937 gen(seed);
-    std::string s(n, '\0');
-    for (char &c : s) c = static_cast<char>(gen());
-    return s;
-}
+using fwpack::Header;
 
 inline std::string ReadFile(const std::string &path) {
     std::ifstream in(path, std::ios::binary);
-    std::ostringstream all;
-    all << in.rdbuf();
-    return all.str();
+    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
 }
 
 inline int OpenDescriptors() {
@@ -148,13 +136,11 @@ protected:
         std::filesystem::create_directories(dir_ + "/manager");
         oldCwd_ = std::filesystem::current_path();
         std::filesystem::current_path(dir_);
-        vdev::Reset();
         LoggerHost_StartCapture();
         IsDisconnected = 0;
         hibernation_flag = 0;
-        fd_ = ::open(vdev::kPrn, O_RDWR);
+        ReopenNode();
         ASSERT_GT(fd_, 0);
-        vdev::SetInstantTimeouts(vdev::kPrn, true);
         // A silent manager costs this much per receive, not 5.5 s.
         UpdateManager_SetWaitMs(kShortWaitMs);
     }
@@ -172,6 +158,13 @@ protected:
     }
 
     static constexpr int kShortWaitMs = 400;
+
+    // A new emulated print node, nothing pending, its time-outs instant.
+    void ReopenNode() {
+        vdev::Reset();
+        fd_ = ::open(vdev::kPrn, O_RDWR);
+        vdev::SetInstantTimeouts(vdev::kPrn, true);
+    }
 
     // What the host sent and nobody has read yet (the print reader's).
     std::string TakePending() {

@@ -47,9 +47,7 @@ TEST_F(FirmwareTest, StreamsThatAreNotFirmwareComeBackAsData) {
         EXPECT_EQ(LoggerHost_Count("Not a FirmWare\r\n"), 1);
         // Only the header was taken; the rest waits for the print reader.
         EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), r.stream.size() - 80);
-        vdev::Reset();
-        fd_ = ::open(vdev::kPrn, O_RDWR);
-        vdev::SetInstantTimeouts(vdev::kPrn, true);
+        ReopenNode();
     }
 }
 
@@ -75,9 +73,7 @@ TEST_F(FirmwareTest, CommandLengthOfEightyIsRefusedAndSeventyNineReadsOneByte) {
     // Nothing is discarded: the channel still holds what followed.
     EXPECT_TRUE(vdev::ReadSizes(vdev::kPrn).empty());
 
-    vdev::Reset();
-    fd_ = ::open(vdev::kPrn, O_RDWR);
-    vdev::SetInstantTimeouts(vdev::kPrn, true);
+    ReopenNode();
     o = Download(std::string(79, 'x') + "yz", {1}, 79);
     EXPECT_EQ(vdev::ReadSizes(vdev::kPrn).at(0), 1u);
     EXPECT_EQ(o.result, 80);
@@ -91,11 +87,11 @@ TEST_F(FirmwareTest, ImagesReachTheManagerWithChainedChecksums) {
         const char *what;
         std::vector<Image> images;
     } rows[] = {
-        {"one image", {{"E7  ", Body(5000, 1)}}},
-        {"odd body length", {{"ec1 ", Body(1023, 2)}}},
+        {"one image", {{"E7  ", RandomBytes(5000, 1)}}},
+        {"odd body length", {{"ec1 ", RandomBytes(1023, 2)}}},
         {"empty body", {{"ED", ""}}},
-        {"two images", {{"E1", Body(70000, 3)}, {"EE4", Body(333, 4)}}},
-        {"three, one empty", {{"E5", Body(10, 5)}, {"E6", ""}, {"EB", Body(4097, 6)}}},
+        {"two images", {{"E1", RandomBytes(70000, 3)}, {"EE4", RandomBytes(333, 4)}}},
+        {"three, one empty", {{"E5", RandomBytes(10, 5)}, {"E6", ""}, {"EB", RandomBytes(4097, 6)}}},
     };
     size_t seen = 0;
     int ends = 0;
@@ -134,7 +130,7 @@ TEST_F(FirmwareTest, ImagesReachTheManagerWithChainedChecksums) {
 // blocks (68 whole and one short).
 TEST_F(FirmwareTest, BodyInOddPiecesArrivesWholeWithItsMarks) {
     StartManager();
-    const std::string body = Body(70001, 16);
+    const std::string body = RandomBytes(70001, 16);
     testing::internal::CaptureStdout();
     Outcome o = Download(Header("E9", static_cast<uint32_t>(body.size())) + body, {78, 1, 3, 4095, 65537});
     const std::string out = testing::internal::GetCapturedStdout();
@@ -171,7 +167,7 @@ TEST_F(FirmwareTest, ManagerAnswersDecideTheOutcome) {
     for (const Row &r : rows) {
         SCOPED_TRACE(r.what);
         LoggerHost_StartCapture();
-        const std::string body = Body(100, 7);
+        const std::string body = RandomBytes(100, 7);
         std::string want = "$IMG" + Verdict(SCAN) + Verdict(100) + body;
         ScriptedPeer peer(r.answers, want.size() + 2);
         UsePort(peer.port());
@@ -210,7 +206,7 @@ TEST_F(FirmwareTest, MisbehavingManagerFailsTheDownloadWithinItsTimeOuts) {
         StartManager(r.m);
         auto t0 = std::chrono::steady_clock::now();
         QuietStdout quiet;
-        Outcome o = DownloadImages({{"E2", Body(3000, 8)}});
+        Outcome o = DownloadImages({{"E2", RandomBytes(3000, 8)}});
         EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(3));
         EXPECT_EQ(o.result, r.result);
         EXPECT_EQ(LoggerHost_Count(r.line), 1);
@@ -237,7 +233,7 @@ TEST_F(FirmwareTest, ProgressThatNeverReachesItsEndIsCapped) {
         StartManager(r.m);
         auto t0 = std::chrono::steady_clock::now();
         QuietStdout quiet;
-        Outcome o = DownloadImages({{"E7", Body(2000, 15)}});
+        Outcome o = DownloadImages({{"E7", RandomBytes(2000, 15)}});
         const auto took = std::chrono::steady_clock::now() - t0;
         EXPECT_EQ(o.result, r.result);
         EXPECT_EQ(LoggerHost_Count("PROGRESS not done within 0 s\r\n"), r.capped);
@@ -270,7 +266,7 @@ TEST_F(FirmwareTest, FailuresBeforeTheBodyDiscardItAndTheNextJobStaysWhole) {
         LoggerHost_StartCapture();
         if (r.manager) StartManager();
         else UsePort(1);  // nothing listens there
-        const std::string body = Body(3000, 9);
+        const std::string body = RandomBytes(3000, 9);
         QuietStdout quiet;
         Outcome o = Download(Header(r.id, 3000) + body + job, {78, 3000});
         EXPECT_EQ(o.result, -1);
@@ -279,9 +275,7 @@ TEST_F(FirmwareTest, FailuresBeforeTheBodyDiscardItAndTheNextJobStaysWhole) {
         EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), job.size());
         EXPECT_EQ(manager_.Connections(), 0);
         manager_.Stop();
-        vdev::Reset();
-        fd_ = ::open(vdev::kPrn, O_RDWR);
-        vdev::SetInstantTimeouts(vdev::kPrn, true);
+        ReopenNode();
     }
 }
 
@@ -309,7 +303,7 @@ TEST_F(FirmwareTest, CutOrOverAnnouncedBodiesEndBoundedAndTakeNothingMore) {
         IsDisconnected = r.cablePulled;
         auto t0 = std::chrono::steady_clock::now();
         QuietStdout quiet;
-        Outcome o = Download(Header("E7", r.announced) + Body(r.sent, 10), {78});
+        Outcome o = Download(Header("E7", r.announced) + RandomBytes(r.sent, 10), {78});
         EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(3));
         EXPECT_EQ(o.result, r.result);
         EXPECT_EQ(o.firmware, 1);
@@ -325,7 +319,7 @@ TEST_F(FirmwareTest, CutOrOverAnnouncedBodiesEndBoundedAndTakeNothingMore) {
 
 TEST_F(FirmwareTest, WhatFollowsTheLastImageDecidesTheEnd) {
     StartManager();
-    const std::string body = Body(500, 11);
+    const std::string body = RandomBytes(500, 11);
     const std::string second = "\x1b%-12345X@PJL ENTER LANGUAGE=PCL\r\n" + std::string(60, 'q');
     struct Row {
         const char *what;
@@ -362,7 +356,7 @@ TEST_F(FirmwareTest, ClassifierReportsTheDownloadAndTheReaderGoesOn) {
     };
     for (const Row &r : rows) {
         LoggerHost_StartCapture();
-        const std::string file = Header(r.id, 10) + Body(10, 12);
+        const std::string file = Header(r.id, 10) + RandomBytes(10, 12);
         vdev::HostWrite(vdev::kPrn, file.substr(2, 78));
         vdev::HostWrite(vdev::kPrn, file.substr(80));
         U8 cmd[COMMAND_SIZE] = {0x1B, '%'};
@@ -382,7 +376,7 @@ TEST_F(FirmwareTest, ThousandDownloadsLeaveNoDescriptorBehind) {
     // The manager answers at once; only a loaded machine is slow, and a
     // time-out here would count as a failed download.
     UpdateManager_SetWaitMs(2000);
-    const std::vector<Image> images = {{"E7", Body(64, 13)}, {"E1", Body(33, 14)}};
+    const std::vector<Image> images = {{"E7", RandomBytes(64, 13)}, {"E1", RandomBytes(33, 14)}};
     QuietStdout quiet;
     DownloadImages(images);  // first use may open what stays for good (logging)
     ASSERT_TRUE(manager_.WaitFor([&] { return manager_.Active() == 0; }, 3000));

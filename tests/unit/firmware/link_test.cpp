@@ -149,7 +149,7 @@ TEST_F(LinkTest, FileGoesInBlocksOfOneKibibyteWithOneMarkEach) {
     };
     for (const Row &r : rows) {
         SCOPED_TRACE(r.size);
-        const std::string body = Body(r.size, static_cast<unsigned>(r.size));
+        const std::string body = RandomBytes(r.size, static_cast<unsigned>(r.size));
         std::ofstream("img.bin", std::ios::binary) << body;
         std::string got;
         std::thread reader([&] {
@@ -222,7 +222,7 @@ TEST_F(LinkTest, NoManagerListeningIsAFailedConnect) {
 }
 
 TEST_F(LinkTest, ImageHandedToThePlatformWriterInBlocks) {
-    std::ofstream(TEMP_FW_IMAGE, std::ios::binary) << Body(0x10000 * 2 + 5, 1);
+    std::ofstream(TEMP_FW_IMAGE, std::ios::binary) << RandomBytes(0x10000 * 2 + 5, 1);
     EXPECT_EQ(write_to_update_manager(0x10000 * 2 + 5), 0);
     EXPECT_EQ(LoggerHost_Count("Writing Firmware data to socket\n"), 3);
     std::filesystem::remove(TEMP_FW_IMAGE);

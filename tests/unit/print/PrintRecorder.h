@@ -17,6 +17,7 @@
 #include "adapter/prn_thread.h"
 #include "common/Wait.h"
 #include "print/USBPrint.h"
+#include "support/Uel.h"
 #include "vdev.h"
 
 namespace rec {
@@ -47,19 +48,13 @@ inline std::vector<Event> &Events() {
     return events;
 }
 // Answers of RegisterJob and of the three application calls.
-inline S8 &RegisterAnswer() {
-    static S8 a = 1;
-    return a;
-}
-inline S32 &AppAnswer() {
-    static S32 a = 0;
-    return a;
-}
+inline S8 registerAnswer = 1;
+inline S32 appAnswer = 0;
 
 // A refused registration is recorded with data "refused" and opens no job.
 inline S8 RegisterJob(const char *) {
-    Events().push_back({Kind::Register, RegisterAnswer() < 0 ? "refused" : ""});
-    return RegisterAnswer();
+    Events().push_back({Kind::Register, registerAnswer < 0 ? "refused" : ""});
+    return registerAnswer;
 }
 inline void PassData(U8 *data, S32 len) {
     Events().push_back({Kind::Pass, std::string(reinterpret_cast<const char *>(data), static_cast<size_t>(len))});
@@ -67,24 +62,23 @@ inline void PassData(U8 *data, S32 len) {
 inline void NotifyEndOfData() { Events().push_back({Kind::End, {}}); }
 inline S32 SendAppType(const char *type) {
     Events().push_back({Kind::AppType, type});
-    return AppAnswer();
+    return appAnswer;
 }
-inline S32 SendAppBuf(const char *type, U8 *buf, S32 len) {
+inline S32 SendAppBuf(const char *, U8 *buf, S32 len) {
     Events().push_back({Kind::AppBuf, std::string(reinterpret_cast<const char *>(buf), static_cast<size_t>(len))});
-    (void)type;
-    return AppAnswer();
+    return appAnswer;
 }
 inline S32 NotifyAppEnd(const char *type) {
     Events().push_back({Kind::AppEnd, type});
-    return AppAnswer();
+    return appAnswer;
 }
 
 inline const TPrintDelivery kRecorder = {RegisterJob, PassData, NotifyEndOfData, SendAppType, SendAppBuf, NotifyAppEnd};
 
 inline void Clear() {
     Events().clear();
-    RegisterAnswer() = 1;
-    AppAnswer() = 0;
+    registerAnswer = 1;
+    appAnswer = 0;
 }
 
 // Jobs in order. Data passed outside a registered job fails the test: the
@@ -138,7 +132,11 @@ inline std::string Delivered() {
 
 }  // namespace rec
 
-inline const std::string kUel = "\x1b%-12345X";
+// `line` logged once; nullptr for a table row that expects none.
+inline void ExpectLoggedOnce(const char *line) {
+    if (!line) return;
+    EXPECT_EQ(LoggerHost_Count(line), 1) << line;
+}
 
 // The reader over the emulated print node, turn by turn, delivering to the
 // recorder. Time-outs on the node are instant, so a turn with nothing pending
@@ -175,6 +173,16 @@ protected:
         slPollTimeout = POLL_TIMEOUT_IDLE;
         splitPatternMarker = 0;
         UelPosition = 0;
+    }
+    // A new case in a loop: nothing recorded, the reader fresh; with `node`
+    // also a new emulated node.
+    static void Restart(bool node = false) {
+        rec::Clear();
+        ResetReader();
+        if (!node) return;
+        vdev::Reset();
+        fdPrn = ::open(vdev::kPrn, O_RDWR);
+        vdev::SetInstantTimeouts(vdev::kPrn, true);
     }
 
     // Turns of the reader until every host byte has been taken (bounded).

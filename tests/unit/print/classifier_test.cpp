@@ -31,7 +31,8 @@ class Classifier : public ReaderTest {
 protected:
     // The reader has taken `first2`; `rest` is what the host sends behind them.
     static Outcome Classify(const std::string &first2, const std::vector<std::string> &rest = {}) {
-        for (const std::string &t : rest) vdev::HostWrite(vdev::kPrn, t);
+        for (const std::string &t : rest)
+            if (!t.empty()) vdev::HostWrite(vdev::kPrn, t);
         U8 cmd[COMMAND_SIZE] = {};
         std::memcpy(cmd, first2.data(), 2);
         U8 fw[FRM_DETECT_BUFFER_SIZE];
@@ -46,139 +47,118 @@ protected:
     }
 };
 
+// Which class two bytes select; the scan family and the applications behind
+// ESC 0x91 answer on the print node.
 TEST_F(Classifier, SelectorByteChoosesTheClass) {
-    struct Row {
-        std::string first2;
+    const struct {
+        const char *first2;
         TUSBAdp_ParserID id;
+        bool answersOnPrintNode;
         const char *line;
     } rows[] = {
-        {"\x1b$", enVLX_PARSER, "[USBAdp] Hostapp Type[1]: VLX\n"},
-        {"\x1b%", enPJL_PARSER, "[USBAdp] Hostapp Type[6]: PJL\n"},
-        {"\x1bw", enMAA_PARSER, "[USBAdp] Hostapp Type[5]: MAA\n"},
-        {"\x1b\x91", enIDS_PARSER, "[USBAdp] Hostapp Type[2]: IDS\n"},
-        {"\x1b\x9a", enS2A_PARSER, "[USBAdp] Hostapp Type[3]: SCAN2PC\n"},
-        {"\x1b\xa8", enPCSCAN_PARSER, "[USBAdp] Hostapp Type[0]: PC_SCAN\n"},
-        {"\x1b\xaa", enTAVIK_LIGHT_PARSER, "[USBAdp] Hostapp Type[4]: TAVIK_LIGHT\n"},
-        {"\x1b\x45", enOther, "[USBAdp] Hostapp Type[10]: OTHERS\n"},
-        {"%\x1b", enOther, "[USBAdp] Hostapp Type[10]: OTHERS\n"},
+        {"\x1b$", enVLX_PARSER, true, "[USBAdp] Hostapp Type[1]: VLX\n"},
+        {"\x1b%", enPJL_PARSER, false, "[USBAdp] Hostapp Type[6]: PJL\n"},
+        {"\x1bw", enMAA_PARSER, false, "[USBAdp] Hostapp Type[5]: MAA\n"},
+        {"\x1b\x91", enIDS_PARSER, true, "[USBAdp] Hostapp Type[2]: IDS\n"},
+        {"\x1b\x9a", enS2A_PARSER, true, "[USBAdp] Hostapp Type[3]: SCAN2PC\n"},
+        {"\x1b\xa8", enPCSCAN_PARSER, true, "[USBAdp] Hostapp Type[0]: PC_SCAN\n"},
+        {"\x1b\xaa", enTAVIK_LIGHT_PARSER, true, "[USBAdp] Hostapp Type[4]: TAVIK_LIGHT\n"},
+        {"\x1b\x45", enOther, false, "[USBAdp] Hostapp Type[10]: OTHERS\n"},
+        {"%\x1b", enOther, false, "[USBAdp] Hostapp Type[10]: OTHERS\n"},
     };
-    for (const Row &r : rows) {
+    for (const auto &r : rows) {
         SCOPED_TRACE(r.line);
         LoggerHost_StartCapture();
+        slDeviceHndl = -7;
         EXPECT_EQ(Classify(r.first2).id, r.id);
         EXPECT_EQ(LoggerHost_Count(r.line), 1);
+        EXPECT_EQ(slDeviceHndl.load() == fdPrn.load(), r.answersOnPrintNode);
     }
 }
 
-TEST_F(Classifier, ScanFamilyAnswersGoToThePrintNode) {
-    for (const char *first2 : {"\x1b$", "\x1b\x9a", "\x1b\xa8", "\x1b\xaa"}) {
-        slDeviceHndl = -7;
-        Classify(first2);
-        EXPECT_EQ(slDeviceHndl.load(), fdPrn.load());
+// What is not a host application goes back to print delivery (result -1) with
+// the bytes taken for the decision, and nothing more is taken off the node.
+TEST_F(Classifier, PrintDataIsHandedBackWithTheBytesTaken) {
+    const std::string pjl = "-12345X@PJL JOB NAME=\"a\"\r\n" + std::string(100, 'p');
+    const struct {
+        const char *first2, *rest;  // the reader has taken first2; rest is on the node
+        S32 result, firmRes;        // firmRes: bytes handed back, missing ones zero
+        size_t left;                // still on the node
+        const char *line;
+    } rows[] = {
+        {"\x1b\x45", "rest of the page", -1, 2, 16, "[USBAdp] Host print job without PJL command\n"},
+        {"\x1b%", pjl.c_str(), -1, 80, pjl.size() - 78, "[USBAdp] Bytes read in FirmWareDownload: 80\n"},
+        {"\x1b%", "-12345X@PJL\r\n", -1, 15, 0, nullptr},
+        // ESC w that is no MAA session: at most the eight bytes of a start command.
+        {"\x1bw", "MAAS", -1, 6, 0, "[USBAdp] Not MAA packet: 6\n"},
+        {"\x1bw", "MAASTARX and more", -1, 10, 9, nullptr},
+        {"\x1bw", "", -2, 0, 0, "[USBAdp] MAA - No Data read\n"},
+        // A short application header is taken as 16 bytes regardless.
+        {"\x1b\x91", "abc", -1, 16, 0, nullptr},
+    };
+    for (const auto &r : rows) {
+        SCOPED_TRACE(testing::PrintToString(std::string(r.first2) + r.rest));
+        Restart(true);
+        LoggerHost_StartCapture();
+        Outcome o = Classify(r.first2, {r.rest});
+        EXPECT_EQ(o.result, r.result);
+        if (r.result == -1) {
+            std::string want = (r.first2 + std::string(r.rest)).substr(0, static_cast<size_t>(r.firmRes));
+            want.resize(static_cast<size_t>(r.firmRes), '\0');
+            EXPECT_EQ(o.handedBack, want);
+        }
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), r.left);
+        ExpectLoggedOnce(r.line);
     }
 }
 
-TEST_F(Classifier, UnknownSelectorIsPrintDataWithItsTwoBytes) {
-    Outcome o = Classify("\x1b\x45", {"rest of the page"});
-    EXPECT_EQ(o.result, -1);
-    EXPECT_EQ(o.firmRes, 2);
-    EXPECT_EQ(o.handedBack, "\x1b\x45");
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] Host print job without PJL command\n"), 1);
-    // Nothing beyond the two bytes was taken off the node.
-    EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), std::string("rest of the page").size());
-}
-
-TEST_F(Classifier, PjlStreamHandsBackUpToEightyHeaderBytes) {
-    std::string stream = kUel + "@PJL JOB NAME=\"a\"\r\n" + std::string(100, 'p');
-    Outcome o = Classify(stream.substr(0, 2), {stream.substr(2)});
-    EXPECT_EQ(o.result, -1);
-    EXPECT_EQ(o.id, enPJL_PARSER);
-    EXPECT_EQ(o.firmRes, 80);
-    EXPECT_EQ(o.handedBack, stream.substr(0, 80));
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] Bytes read in FirmWareDownload: 80\n"), 1);
-}
-
-TEST_F(Classifier, ShortPjlStreamHandsBackWhatThereIs) {
-    std::string shortJob = kUel + "@PJL\r\n";
-    Outcome o = Classify(shortJob.substr(0, 2), {shortJob.substr(2)});
-    EXPECT_EQ(o.result, -1);
-    EXPECT_EQ(o.firmRes, static_cast<S32>(shortJob.size()));
-    EXPECT_EQ(o.handedBack, shortJob);
-}
-
-TEST_F(Classifier, EscapeWHandsBackWhatFollowedWhenItIsNoMaaSession) {
-    Outcome o = Classify("\x1bw", {"MAAS"});
-    EXPECT_EQ(o.result, -1);
-    EXPECT_EQ(o.firmRes, 6);
-    EXPECT_EQ(o.handedBack, "\x1bwMAAS");
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] Not MAA packet: 6\n"), 1);
-
-    // At most the eight bytes of a start command are taken.
-    o = Classify("\x1bw", {"MAASTARX and more"});
-    EXPECT_EQ(o.handedBack, "\x1bwMAASTARX");
-    EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), std::string(" and more").size());
-}
-
-TEST_F(Classifier, EscapeWWithNothingBehindIsAFailure) {
-    Outcome o = Classify("\x1bw");
-    EXPECT_EQ(o.result, -2);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] MAA - No Data read\n"), 1);
-}
-
-// ---- the four application packets behind ESC 0x91 -----------------------------
-
-TEST_F(Classifier, DcuPacketIsOneTransferOfHeaderAndBody) {
-    std::string hdr = AppHeader(0x07, 5);
-    Outcome o = Classify(hdr.substr(0, 2), {hdr.substr(2), "<dcu>"});
-    EXPECT_EQ(o.result, 0);
-    auto apps = rec::Apps();
-    ASSERT_EQ(apps.size(), 1u);
-    EXPECT_EQ(apps[0].type, "dcu");
-    EXPECT_EQ(apps[0].writes, (std::vector<std::string>{hdr, "<dcu>"}));
-    EXPECT_TRUE(apps[0].closed);
-    EXPECT_TRUE(rec::Jobs().empty());
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [DCU] DCU Packet length: 5\n"), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] DCU packet\n"), 1);
-}
-
-TEST_F(Classifier, DcuWithEmptyBodyIsRefusedWhileNdAndFaxdSendTheHeaderAlone) {
-    std::string dcu = AppHeader(0x07, 0);
-    Outcome o = Classify(dcu.substr(0, 2), {dcu.substr(2)});
-    EXPECT_EQ(o.result, -2);
-    EXPECT_TRUE(rec::Apps().empty());
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [DCU] slDCUPacketLen[0] <= 0\n"), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in sending DCU packet\n"), 1);
-
-    for (auto [app, type] : {std::pair<U8, std::string>{0x0D, "networkrds"}, {0x0E, "faxd"}}) {
-        SCOPED_TRACE(type);
-        rec::Clear();
-        std::string hdr = AppHeader(app, 0);
-        o = Classify(hdr.substr(0, 2), {hdr.substr(2)});
-        EXPECT_EQ(o.result, 0);
-        auto apps = rec::Apps();
-        ASSERT_EQ(apps.size(), 1u);
-        EXPECT_EQ(apps[0].type, type);
-        EXPECT_EQ(apps[0].writes, (std::vector<std::string>{hdr}));
-        EXPECT_TRUE(apps[0].closed);
+// The application packets behind ESC 0x91, each one transfer to Java of its
+// header and body; AMPV has no body, whatever its length says. An empty DCU
+// body, Java refusing the transfer and an unknown application send nothing.
+TEST_F(Classifier, ApplicationPacketIsOneTransferOfHeaderAndBody) {
+    const struct {
+        U8 app;
+        S32 length;
+        const char *body;  // sent behind the header
+        S32 answer;        // Java's answer to the application calls
+        S32 result;
+        const char *type;  // of the transfer; nullptr: none
+        const char *line, *line2;
+    } rows[] = {
+        {0x07, 5, "<dcu>", 0, 0, "dcu", "[USBAdp] [DCU] DCU Packet length: 5\n", "[USBAdp] DCU packet\n"},
+        {0x07, 0, "", 0, -2, nullptr, "[USBAdp] [DCU] slDCUPacketLen[0] <= 0\n",
+         "[USBAdp] Error in sending DCU packet\n"},
+        {0x0D, 0, "", 0, 0, "networkrds", "[USBAdp] [ND] ND Sub Request  length: 0\n", nullptr},
+        {0x0D, 3, "abc", 0, 0, "networkrds", nullptr, nullptr},
+        {0x0E, 0, "", 0, 0, "faxd", "[USBAdp] [FAXD] FAXD Sub Request length: 0\n", nullptr},
+        {0x06, 1000, "", 0, 0, "ampv", nullptr, nullptr},
+        {0x0D, 0, "", -1, -2, nullptr, "[USBAdp] [ND] Error in Sending ND AppType\n",
+         "[USBAdp] Error in sending ND packet\n"},
+        {0x55, 4, "tail", 0, -1, nullptr, "[USBAdp] [DCU] pubCommand[7]: 0x55\n", nullptr},
+    };
+    for (const auto &r : rows) {
+        SCOPED_TRACE(testing::Message() << "app " << int{r.app} << ", length " << r.length);
+        Restart(true);
+        LoggerHost_StartCapture();
+        rec::appAnswer = r.answer;
+        const std::string hdr = AppHeader(r.app, r.length);
+        Outcome o = Classify(hdr.substr(0, 2), {hdr.substr(2), r.body});
+        EXPECT_EQ(o.result, r.result);
+        const auto apps = rec::Apps();
+        if (r.type) {
+            ASSERT_EQ(apps.size(), 1u);
+            EXPECT_EQ(apps[0].type, r.type);
+            EXPECT_EQ(apps[0].writes, (*r.body ? std::vector<std::string>{hdr, r.body} : std::vector{hdr}));
+            EXPECT_TRUE(apps[0].closed);
+        } else if (r.answer == 0) {
+            EXPECT_TRUE(apps.empty());
+        }
+        EXPECT_TRUE(rec::Jobs().empty());
+        EXPECT_EQ(o.handedBack, r.result == -1 ? hdr : "");
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), r.result == -1 ? std::strlen(r.body) : 0u);
+        ExpectLoggedOnce(r.line);
+        ExpectLoggedOnce(r.line2);
     }
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [ND] ND Sub Request  length: 0\n"), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [FAXD] FAXD Sub Request length: 0\n"), 1);
-}
-
-TEST_F(Classifier, AmpvIsHeaderOnlyAndNdCarriesItsBody) {
-    std::string ampv = AppHeader(0x06, 1000);  // AMPV has no body: the length is not looked at
-    Outcome o = Classify(ampv.substr(0, 2), {ampv.substr(2)});
-    EXPECT_EQ(o.result, 0);
-    std::string nd = AppHeader(0x0D, 3);
-    o = Classify(nd.substr(0, 2), {nd.substr(2), "abc"});
-    EXPECT_EQ(o.result, 0);
-    auto apps = rec::Apps();
-    ASSERT_EQ(apps.size(), 2u);
-    EXPECT_EQ(apps[0].type, "ampv");
-    EXPECT_EQ(apps[0].writes, (std::vector<std::string>{ampv}));
-    EXPECT_EQ(apps[1].type, "networkrds");
-    EXPECT_EQ(apps[1].writes, (std::vector<std::string>{nd, "abc"}));
-    EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), 0u);
 }
 
 TEST_F(Classifier, BodyWaitsOutDriverTimeOutsUntilItIsComplete) {
@@ -232,7 +212,7 @@ TEST_F(Classifier, BodyCutByACablePullIsDroppedAndMakesNoPrintJob) {
     };
     for (const auto &r : rows) {
         SCOPED_TRACE(int{r.app});
-        rec::Clear();
+        Restart();
         vdev::HostWrite(vdev::kPrn, AppHeader(r.app, 10));
         vdev::HostWrite(vdev::kPrn, "part");
         IsDisconnected = 1;  // the pull comes while the reader waits for the rest
@@ -243,35 +223,6 @@ TEST_F(Classifier, BodyCutByACablePullIsDroppedAndMakesNoPrintJob) {
         EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in executing Host App\n"), 1);
         LoggerHost_StartCapture();
     }
-}
-
-TEST_F(Classifier, JavaRefusingTheTransferIsAFailure) {
-    rec::AppAnswer() = -1;
-    std::string hdr = AppHeader(0x0D, 0);
-    Outcome o = Classify(hdr.substr(0, 2), {hdr.substr(2)});
-    EXPECT_EQ(o.result, -2);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [ND] Error in Sending ND AppType\n"), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in sending ND packet\n"), 1);
-}
-
-TEST_F(Classifier, UnknownApplicationHeaderIsPrintDataOfSixteenBytes) {
-    std::string hdr = AppHeader(0x55, 4);
-    Outcome o = Classify(hdr.substr(0, 2), {hdr.substr(2) + "tail"});
-    EXPECT_EQ(o.result, -1);
-    EXPECT_EQ(o.id, enIDS_PARSER);
-    EXPECT_EQ(o.firmRes, 16);
-    EXPECT_EQ(o.handedBack, hdr);
-    EXPECT_TRUE(rec::Apps().empty());
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] [DCU] pubCommand[7]: 0x55\n"), 1);
-}
-
-TEST_F(Classifier, ShortHeaderIsStillSixteenBytesWithNothingOfEarlierStreams) {
-    // Only 3 bytes follow ESC 0x91: the header is taken as 16 bytes regardless,
-    // the missing ones zero.
-    Outcome o = Classify("\x1b\x91", {"abc"});
-    EXPECT_EQ(o.result, -1);
-    EXPECT_EQ(o.firmRes, 16);
-    EXPECT_EQ(o.handedBack, std::string("\x1b\x91" "abc") + std::string(11, '\0'));
 }
 
 }  // namespace

@@ -2,18 +2,15 @@
 // would get. The first rule everywhere: every byte the host sent as print data
 // is passed exactly once, in order.
 #include <chrono>
-#include <cstring>
+#include <functional>
 #include <random>
 #include <string>
 #include <vector>
 
 #include "print/PrintRecorder.h"
+#include "support/RandomBytes.h"
 
 namespace {
-
-using Framing = ReaderTest;
-
-std::string Framed(const std::string &payload) { return kUel + payload + kUel; }
 
 // Host data the classifier must not take for an application: escapes are
 // followed only by '%', another escape or 'E'; partial and spoiled UELs included.
@@ -52,6 +49,23 @@ void ExpectJobs(const std::vector<std::string> &expected) {
     }
 }
 
+class Framing : public ReaderTest {
+protected:
+    // `stream` cut into two and three transfers at every pair of cuts (the second
+    // one every `step` bytes), each sent to a fresh reader and then `check`ed.
+    static void EveryCut(const std::string &stream, size_t step, const std::function<void()> &check) {
+        for (size_t c1 = 1; c1 < stream.size(); ++c1) {
+            for (size_t c2 = c1; c2 < stream.size(); c2 += step) {
+                SCOPED_TRACE(testing::Message() << "stream of " << stream.size() << ", cuts " << c1 << ", " << c2);
+                Restart();
+                Send(c1 == c2 ? CutAt(stream, {c1}) : CutAt(stream, {c1, c2}));
+                check();
+                if (HasFailure()) return;
+            }
+        }
+    }
+};
+
 // ---- single cases ----------------------------------------------------------
 
 TEST_F(Framing, UelFramedJobInOneReadIsOneJobOfOnePass) {
@@ -83,8 +97,7 @@ TEST_F(Framing, OpenUelJobWaitsFiveMinutesAndSilenceEndsIt) {
 TEST_F(Framing, HeldUelBytesBecomeAJobOfTheirOwnAfterSilence) {
     for (size_t k = 1; k <= 8; ++k) {
         SCOPED_TRACE(k);
-        rec::Clear();
-        ResetReader();
+        Restart();
         LoggerHost_StartCapture();
         Send({Framed("A") + kUel.substr(0, k)});
         ExpectJobs({Framed("A"), kUel.substr(0, k)});
@@ -92,22 +105,40 @@ TEST_F(Framing, HeldUelBytesBecomeAJobOfTheirOwnAfterSilence) {
     }
 }
 
-TEST_F(Framing, HeldUelBytesOfAnOpenJobStayInItWhenSilenceEndsIt) {
-    Send({"plain page data\x1b%-12"});
-    ExpectJobs({"plain page data\x1b%-12"});
-    EXPECT_EQ(LoggerHost_Count("[USBAdp]Held UEL bytes passed at end of job: [5]\n"), 1);
-}
-
-TEST_F(Framing, UelBehindDataEndsTheJobUnlessItIsLastInTheRead) {
-    Send({"end of a job" + kUel + Framed("next")});
-    ExpectJobs({"end of a job" + kUel, Framed("next")});
-
-    rec::Clear();
-    Send({"lead-in" + kUel}, false);
-    ASSERT_EQ(rec::Jobs().size(), 1u);
-    EXPECT_FALSE(rec::Jobs()[0].ended);
-    Send({"body" + kUel}, false);
-    ExpectJobs({"lead-in" + kUel + "body" + kUel});
+// Host transfers and the jobs they make. Data without a UEL is one job until
+// silence, held UEL bytes included; a UEL behind data ends the job, unless it
+// is last in the read and the job's first.
+TEST_F(Framing, TransfersMakeTheJobsOfTheStream) {
+    const struct {
+        const char *transfers[3];
+        const char *jobs[2];
+        bool silenceEnds;  // the last job is open until the silence after the transfers
+        const char *line;
+    } rows[] = {
+        {{"Z"}, {"Z"}, true, nullptr},
+        {{"Y", "ab", "c"}, {"Yabc"}, true, nullptr},
+        {{"plain page data\x1b%-12"}, {"plain page data\x1b%-12"}, true,
+         "[USBAdp]Held UEL bytes passed at end of job: [5]\n"},
+        {{"end of a job\x1b%-12345X\x1b%-12345Xnext\x1b%-12345X"},
+         {"end of a job\x1b%-12345X", "\x1b%-12345Xnext\x1b%-12345X"}, false, nullptr},
+        {{"lead-in\x1b%-12345X", "body\x1b%-12345X"}, {"lead-in\x1b%-12345Xbody\x1b%-12345X"}, false, nullptr},
+    };
+    for (const auto &r : rows) {
+        SCOPED_TRACE(r.jobs[0]);
+        Restart();
+        LoggerHost_StartCapture();
+        std::vector<std::string> transfers, jobs;
+        for (const char *t : r.transfers)
+            if (t) transfers.push_back(t);
+        for (const char *j : r.jobs)
+            if (j) jobs.push_back(j);
+        Send(transfers, false);
+        ASSERT_EQ(rec::Jobs().size(), jobs.size());
+        EXPECT_EQ(rec::Jobs().back().ended, !r.silenceEnds);
+        Silence();
+        ExpectJobs(jobs);
+        ExpectLoggedOnce(r.line);
+    }
 }
 
 TEST_F(Framing, ShortPjlPrefixIsDeliveredWithoutAFurtherRead) {
@@ -121,17 +152,6 @@ TEST_F(Framing, ShortPjlPrefixIsDeliveredWithoutAFurtherRead) {
     ASSERT_EQ(jobs.size(), 1u);
     EXPECT_EQ(jobs[0].chunks, (std::vector<size_t>{first.size()}));
     EXPECT_EQ(LoggerHost_Count("[USBAdp] Data less than 80bytes: 15\n"), 1);
-}
-
-TEST_F(Framing, DataWithoutUelIsOneJobUntilSilence) {
-    Send({"Z"});
-    ExpectJobs({"Z"});
-    rec::Clear();
-    Send({"Y", "ab", "c"}, false);
-    ASSERT_EQ(rec::Jobs().size(), 1u);
-    EXPECT_FALSE(rec::Jobs()[0].ended);
-    Silence();
-    ExpectJobs({"Yabc"});
 }
 
 // An empty transfer reads as 0 bytes: it ends a job like a silence, at once,
@@ -150,29 +170,28 @@ TEST_F(Framing, EmptyTransferEndsTheJobAtOnce) {
 }
 
 TEST_F(Framing, RefusedJobDropsItsChunkAndTheNextChunkTriesAgain) {
-    rec::RegisterAnswer() = -1;
+    rec::registerAnswer = -1;
     Send({"dropped"}, false);
     EXPECT_EQ(rec::Delivered(), "");
     EXPECT_EQ(LoggerHost_Count("[USBAdp]returning back\n"), 1);
-    rec::RegisterAnswer() = 1;
+    rec::registerAnswer = 1;
     Send({"kept"});
     ExpectJobs({"kept"});
 
     // The same with framed jobs: the refused job's UEL is not counted for the next.
     rec::Clear();
-    rec::RegisterAnswer() = -1;
+    rec::registerAnswer = -1;
     Send({Framed("refused")}, false);
-    rec::RegisterAnswer() = 1;
+    rec::registerAnswer = 1;
     Send({Framed("accepted")});
     ExpectJobs({Framed("accepted")});
-}
 
-TEST_F(Framing, RefusedJobDropsAUelCutAtItsEndWithIt) {
     // The refused chunk ends in a cut UEL behind eleven bytes of data; the next,
     // shorter chunk has no escape and is a job of its own, as it is.
-    rec::RegisterAnswer() = -1;
+    Restart();
+    rec::registerAnswer = -1;
     Send({"longer data\x1b%"}, false);
-    rec::RegisterAnswer() = 1;
+    rec::registerAnswer = 1;
     Send({"ab"});
     ExpectJobs({"ab"});
 }
@@ -236,16 +255,7 @@ TEST_F(Framing, FramedJobsSurviveEveryCutIntoTwoAndThreeTransfers) {
         stream += expected.back();
     }
     LoggerHost_StopCapture();
-    for (size_t c1 = 1; c1 < stream.size(); ++c1) {
-        for (size_t c2 = c1; c2 < stream.size(); ++c2) {
-            SCOPED_TRACE(testing::Message() << "cuts " << c1 << ", " << c2);
-            rec::Clear();
-            ResetReader();
-            Send(c1 == c2 ? CutAt(stream, {c1}) : CutAt(stream, {c1, c2}));
-            ExpectJobs(expected);
-            if (HasFailure()) return;
-        }
-    }
+    EveryCut(stream, 1, [&] { ExpectJobs(expected); });
 }
 
 TEST_F(Framing, LooseStreamsPassEveryByteOnceWhereverTheyAreCut) {
@@ -257,17 +267,11 @@ TEST_F(Framing, LooseStreamsPassEveryByteOnceWhereverTheyAreCut) {
     };
     LoggerHost_StopCapture();
     for (const std::string &stream : streams) {
-        for (size_t c1 = 1; c1 < stream.size(); ++c1) {
-            for (size_t c2 = c1; c2 < stream.size(); c2 += 3) {
-                SCOPED_TRACE(testing::Message() << "stream of " << stream.size() << ", cuts " << c1 << ", " << c2);
-                rec::Clear();
-                ResetReader();
-                Send(c1 == c2 ? CutAt(stream, {c1}) : CutAt(stream, {c1, c2}));
-                EXPECT_EQ(rec::Delivered(), stream);
-                for (const rec::Job &j : rec::Jobs()) EXPECT_TRUE(j.ended);
-                if (HasFailure()) return;
-            }
-        }
+        EveryCut(stream, 3, [&] {
+            EXPECT_EQ(rec::Delivered(), stream);
+            for (const rec::Job &j : rec::Jobs()) EXPECT_TRUE(j.ended);
+        });
+        if (HasFailure()) return;
     }
 }
 
@@ -290,11 +294,7 @@ TEST_F(Framing, UelCutAfterAnyOfItsBytesIsRecognisedInTheNextRead) {
             };
             for (size_t v = 0; v < variants.size(); ++v) {
                 SCOPED_TRACE(testing::Message() << "UEL at " << at << " cut after byte " << k << ", variant " << v);
-                rec::Clear();
-                ResetReader();
-                vdev::Reset();
-                fdPrn = ::open(vdev::kPrn, O_RDWR);
-                vdev::SetInstantTimeouts(vdev::kPrn, true);
+                Restart(true);
                 Send(variants[v], false);
                 ExpectJobs(jobs);
                 EXPECT_EQ(vdev::ExpiredPolls(vdev::kPrn), 0u) << "a job waited for silence";
@@ -305,16 +305,6 @@ TEST_F(Framing, UelCutAfterAnyOfItsBytesIsRecognisedInTheNextRead) {
 }
 
 // ---- large jobs --------------------------------------------------------------
-
-std::string RandomBytes(size_t size, uint64_t seed) {
-    std::mt19937_64 rng(seed);
-    std::string out(size, '\0');
-    for (size_t i = 0; i + 8 <= size; i += 8) {
-        uint64_t v = rng();
-        std::memcpy(&out[i], &v, 8);
-    }
-    return out;
-}
 
 // Transfers of `size`; a transfer never starts with an escape, which would
 // make the classifier look for a host application there.
@@ -342,8 +332,7 @@ TEST_F(Framing, LargeJobsArriveWhole) {
     const std::pair<std::vector<std::string>, size_t> cases[] = {
         {Transfers(Framed(RandomBytes((40u << 20) - 18, 42)), 1u << 20), 40}, {unframed, 0}};
     for (const auto &[transfers, chunks] : cases) {
-        rec::Clear();
-        ResetReader();
+        Restart();
         const std::string stream = Join(transfers);
         Send(transfers);
         auto jobs = rec::Jobs();

@@ -35,7 +35,7 @@ protected:
     UniqueFd savedStdin_;
 };
 
-TEST_F(ReaderSetup, NodeIsOpenedOwnedAsyncBlockingWithFiveSecondReads) {
+TEST_F(ReaderSetup, NodeIsOpenedOnceOwnedAsyncBlockingWithFiveSecondReads) {
     vdev::SetTimeouts({1, 2, 3, 4});
     ASSERT_EQ(::fcntl(0, F_SETFL, O_NONBLOCK), 0);  // taken over by the node, then cleared
 
@@ -54,10 +54,8 @@ TEST_F(ReaderSetup, NodeIsOpenedOwnedAsyncBlockingWithFiveSecondReads) {
     EXPECT_TRUE(LoggerHost_Contains("[USBAdp] FdPrn flags: "));
     EXPECT_EQ(std::string(reinterpret_cast<char *>(aub_serial_str)), "0000-00000000000");
     EXPECT_TRUE(LoggerHost_Contains("[USBAdp]Exited Initialization(), fdPrn:"));
-}
 
-TEST_F(ReaderSetup, AnOpenNodeIsNotOpenedAgain) {
-    Initialization();
+    // An open node is not opened again.
     const int first = fdPrn;
     Initialization();
     EXPECT_EQ(fdPrn.load(), first);

@@ -81,16 +81,9 @@ TEST_F(ReaderSignals, HungUpNodeDoesNotMakeTheReaderSpin) {
     } rows[] = {{"idle", "", 0}, {"held UEL bytes", "page\x1b%-12", 1}};
     for (const auto &r : rows) {
         SCOPED_TRACE(r.name);
-        rec::Clear();
-        ResetReader();
-        vdev::Reset();
-        fdPrn = ::open(vdev::kPrn, O_RDWR);
+        Restart(true);
         IsConfigured = 1;
-        slPollTimeout = 5000;
-        if (!r.before.empty()) {
-            vdev::SetInstantTimeouts(vdev::kPrn, true);
-            Send({r.before}, false);
-        }
+        if (!r.before.empty()) Send({r.before}, false);
         vdev::Reset();  // the reader's descriptor is dead: ready, and reads give 0
         const WorkTime t = TimeUntilStopped(
             [] {

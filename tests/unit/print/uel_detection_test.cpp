@@ -10,6 +10,9 @@ class UelDetection : public ::testing::Test {
 protected:
     void SetUp() override {
         LoggerHost_StartCapture();
+        Clear();
+    }
+    static void Clear() {
         jobCounter = 0;
         splitPatternFlag = 0;
         splitPatternMarker = 0;
@@ -21,54 +24,44 @@ protected:
     }
 };
 
-TEST_F(UelDetection, WholeUelIsFoundWhereverItLiesAndCounted) {
-    EXPECT_EQ(Check(kUel), 1);
-    EXPECT_EQ(UelPosition, 0);
-    EXPECT_EQ(jobCounter, 1);
-
-    EXPECT_EQ(Check("@PJL data " + kUel + "tail"), 1);
-    EXPECT_EQ(UelPosition, 10);
-    EXPECT_EQ(jobCounter, 2);
-    EXPECT_EQ(splitPatternFlag, 0);
+// Where the first whole UEL lies; a mismatch is scanned again from the
+// mismatching byte, and a lone escape at the end is one byte of a cut UEL.
+TEST_F(UelDetection, FirstWholeUelIsFoundWhereverItLiesAndCounted) {
+    const struct {
+        const char *bytes;
+        S32 found, position, marker;  // answer, UelPosition, splitPatternMarker
+    } rows[] = {
+        {"\x1b%-12345X", 1, 0, 0},
+        {"@PJL data \x1b%-12345Xtail", 1, 10, 0},
+        {"ab\x1b%-12345Xcd\x1b%-12345X", 1, 2, 0},
+        {"\x1b%-12345Y\x1b%-12345X", 1, 9, 0},
+        {"\x1b%-12345\x1b%-12345X", 1, 8, 0},
+        {"\x1b%-12345Y tail", 0, 0, 0},
+        {"\x1b", 0, 0, 1},
+    };
+    for (const auto &r : rows) {
+        SCOPED_TRACE(testing::PrintToString(r.bytes));
+        Clear();
+        EXPECT_EQ(Check(r.bytes), r.found);
+        EXPECT_EQ(UelPosition, r.position);
+        EXPECT_EQ(jobCounter, r.found);
+        EXPECT_EQ(splitPatternMarker, r.marker);
+        EXPECT_EQ(splitPatternFlag, r.marker > 0 ? 1 : 0);
+    }
     EXPECT_EQ(LoggerHost_Count("[USBAdp]return TRUE HITT UelPosition[10]\n"), 1);
-}
-
-TEST_F(UelDetection, OnlyTheFirstOfTwoUelsIsReported) {
-    EXPECT_EQ(Check("ab" + kUel + "cd" + kUel), 1);
-    EXPECT_EQ(UelPosition, 2);
-    EXPECT_EQ(jobCounter, 1);
 }
 
 TEST_F(UelDetection, UelCutByTheBufferEndGivesTheNumberOfBytesPresent) {
     for (int present = 1; present <= 8; ++present) {
         SCOPED_TRACE(present);
-        splitPatternFlag = 0;
-        splitPatternMarker = 0;
+        Clear();
         EXPECT_EQ(Check("job data" + kUel.substr(0, present)), 0);
         EXPECT_EQ(splitPatternFlag, 1);
         EXPECT_EQ(splitPatternMarker, present);
         EXPECT_EQ(UelPosition, 8);
+        EXPECT_EQ(jobCounter, 0);
     }
-    EXPECT_EQ(jobCounter, 0);
     EXPECT_EQ(LoggerHost_Count("[USBAdp]splitPatternMarker : [7]\n"), 1);
-}
-
-TEST_F(UelDetection, LoneEscapeAtTheEndIsOneBytePresent) {
-    EXPECT_EQ(Check("\x1b"), 0);
-    EXPECT_EQ(splitPatternMarker, 1);
-    EXPECT_EQ(UelPosition, 0);
-}
-
-TEST_F(UelDetection, MismatchIsScannedAgainFromTheMismatchingByte) {
-    // Y in place of X: not a UEL, and the scan goes on at the Y.
-    EXPECT_EQ(Check("\x1b%-12345Y" + kUel), 1);
-    EXPECT_EQ(UelPosition, 9);
-    // The mismatching byte is itself the start of a UEL.
-    EXPECT_EQ(Check("\x1b%-12345" + kUel), 1);
-    EXPECT_EQ(UelPosition, 8);
-    EXPECT_EQ(Check("\x1b%-12345Y tail"), 0);
-    EXPECT_EQ(splitPatternFlag, 0);
-    EXPECT_EQ(jobCounter, 2);
 }
 
 TEST_F(UelDetection, SplitFlagIsLeftForTheReaderToClear) {
