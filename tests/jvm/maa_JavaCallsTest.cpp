@@ -220,11 +220,7 @@ TEST_F(MaaJvm, EngineFailuresEndWithTheirTextsAndLeaveNoException) {
 TEST_F(MaaJvmWithoutUpcalls, EveryCallFailsCleanly) {
     const std::string cannotFindNormal = "Error in Eng_MaaStrNormalTest()::can't find Eng_MaaStrNormalTest()\n";
     const Recs failed{Cont("[ ImageStablization ]"), End("Failed")};
-    struct Case {
-        TMAAResult *(*call)(const Shell &);
-        Recs seen;
-        std::string logged;
-    } cases[] = {
+    struct Case { TMAAResult *(*call)(const Shell &); Recs seen; std::string logged; } cases[] = {
         {[](const Shell &s) { return s.StrIFOpt2(1, 2); }, failed, cannotFindNormal},
         {[](const Shell &s) { return s.PBAStrIFOpt1(1); }, failed, cannotFindNormal},
         {[](const Shell &s) { return s.ImgStbStart(1); }, failed,
@@ -246,11 +242,7 @@ TEST_F(MaaJvmWithoutUpcalls, EveryCallFailsCleanly) {
 
 TEST_F(MaaJvm, GeneralFunctionPassesIdAndArgumentTextsAndSendsTheReplyByItsPrefix) {
     const std::string hundred(100, 'h');
-    struct Case {
-        std::vector<U32> args;
-        std::string reply, journaled;
-        Recs seen;
-    } cases[] = {
+    struct Case { std::vector<U32> args; std::string reply, journaled; Recs seen; } cases[] = {
         {{1000000, Map("text")}, "spider:ABC", "1000000,text", {End("ABC")}},
         {{0, 0xFFFF}, "idpt:L1\r\nL2\r\nL3", "0,65535", {Cont("L1"), Cont("L2"), End("L3")}},
         {{Map(hundred)}, "Volt=3.3\r\n", hundred.substr(0, 99), {End("Volt=3.3\r\n")}},  // no known prefix: whole
@@ -269,10 +261,7 @@ TEST_F(MaaJvm, GeneralFunctionPassesIdAndArgumentTextsAndSendsTheReplyByItsPrefi
 
 TEST_F(MaaJvm, GeneralFunctionRefusesBadArgumentsWithoutCallingJava) {
     const U32 tooLong = Map(std::string(101, 'h'));
-    struct Case {
-        const char *what;
-        std::vector<U32> args;
-    } cases[] = {
+    struct Case { const char *what; std::vector<U32> args; } cases[] = {
         {"1000001 is a text address, and none is mapped there", {1000001}},
         {"a text of 101 characters", {7, tooLong}},
         {"eleven arguments", std::vector<U32>(11, 1)},

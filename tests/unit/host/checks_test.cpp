@@ -11,10 +11,7 @@ namespace maahost {
 namespace {
 
 TEST(CheckDownloadSize, RefusesWhatTheSizeFieldCannotHold) {
-    struct Row {
-        uint64_t size;
-        bool refused;
-    } rows[] = {
+    struct Row { uint64_t size; bool refused; } rows[] = {
         {0, false},
         {1, false},
         {0xFFFFFFFFull, false},
@@ -36,11 +33,7 @@ TEST(CheckDownloadSize, RefusesWhatTheSizeFieldCannotHold) {
 
 TEST(DropBlankLines, KeepsEveryLineTheAutoRunShouldReach) {
     using Lines = std::vector<std::string>;
-    struct Row {
-        const char *name;
-        Lines script;
-        Lines kept;
-    } rows[] = {
+    struct Row { const char *name; Lines script; Lines kept; } rows[] = {
         {"none blank", {"a=1", "probe(7)"}, {"a=1", "probe(7)"}},
         {"empty lines anywhere", {"", "a=1", "", "", "probe(7)", ""}, {"a=1", "probe(7)"}},
         {"spaces and tabs only", {" ", "\t \t", "a=1"}, {"a=1"}},
@@ -57,10 +50,7 @@ TEST(DropBlankLines, KeepsEveryLineTheAutoRunShouldReach) {
 }
 
 TEST(CallsFunction, OnlyANameFollowedByAParenthesisOutsideTextsGetsTheLongWait) {
-    struct Row {
-        const char *line;
-        bool calls;
-    } rows[] = {
+    struct Row { const char *line; bool calls; } rows[] = {
         {"MAA_SymbolDump()", true},
         {"x = Delay_ms (5)", true},
         {"*(char*)(0x01000000 + 36) = 0x74", false},  // casts and grouping

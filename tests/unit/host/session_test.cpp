@@ -158,11 +158,7 @@ TEST_F(ClientTest, HandshakesAndCommandsOnTheWire) {
 
 TEST_F(ClientTest, FramesComeOutAsTheDeviceSentThem) {
     const std::string big = Pattern(200000);  // more than one read of the client
-    struct Row {
-        const char *name;
-        std::string device;
-        std::vector<Frame> frames;
-    } rows[] = {
+    struct Row { const char *name; std::string device; std::vector<Frame> frames; } rows[] = {
         {"records", Record(0, 0, "line 1\r\n") + Record(0, 3, "") + Record(1, 1, "done"),
          {Result(0, 0, "line 1\r\n"), Result(0, 3, ""), Result(1, 1, "done")}},
         {"record that is not sent on", Record(2, 9, "x"), {Result(2, 9, "x")}},
@@ -202,11 +198,7 @@ TEST_F(ClientTest, FramesComeOutAsTheDeviceSentThem) {
 }
 
 TEST_F(ClientTest, CutFramesAreErrorsAfterTheWholeOnes) {
-    struct Row {
-        const char *name;
-        std::string cut;
-        std::string error;
-    } rows[] = {
+    struct Row { const char *name; std::string cut; std::string error; } rows[] = {
         {"header", Record(1, 0, "abc").substr(0, 5), "frame header cut off: 00 00 00 01 00"},
         {"record data", Record(1, 0, "abcdef").substr(0, 14), "frame of 6 bytes cut off after 2"},
         {"file data", Transfer(kOpT2H, 100) + Pattern(10), "frame of 100 bytes cut off after 10"},
@@ -257,10 +249,7 @@ TEST_F(ClientTest, DownloadSendsSizeAndBytesAndReturnsTheAddress) {
 }
 
 TEST(Describe, OneLinePerFrame) {
-    struct Row {
-        Frame frame;
-        std::string line;
-    } rows[] = {
+    struct Row { Frame frame; std::string line; } rows[] = {
         {Result(0, 0, "HIGH\r\n"), "| HIGH"},
         {Result(0, 4, "x"), "| x  (result 4)"},
         {Result(1, 1, ""), "= result 1"},

@@ -46,11 +46,7 @@ protected:
 // row to row): the value the shell logs (nullptr: not checked), the cells
 // afterwards and a line logged.
 TEST_F(Evaluator, StatementsOnDataCells) {
-    struct Step {
-        const char *line, *value;
-        U32 x, y;
-        const char *logged;
-    } steps[] = {
+    struct Step { const char *line, *value; U32 x, y; const char *logged; } steps[] = {
         // Assignment yields the cell; compound assignments.
         {"x = 5", "ValueRef = 5 = 0x5", 5, 0, nullptr},
         {"x = y = 3", "ValueRef = 3 = 0x3", 3, 3, nullptr},

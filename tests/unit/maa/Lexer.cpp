@@ -45,10 +45,7 @@ protected:
 constexpr U32 I = IDENTIFIER;
 
 TEST_F(Lexer, OperatorsTakeTheLongestMatch) {
-    struct Case {
-        const char *text;
-        std::vector<U32> expected;
-    } cases[] = {
+    struct Case { const char *text; std::vector<U32> expected; } cases[] = {
         {"a|&b", {I, LOR, I}},
         {"a||b", {I, '|', '|', I}},
         {"x<<=2", {I, LSE, CONSTANT}},

@@ -56,11 +56,7 @@ TEST_F(JavaCalls, RepliesAreSplitIntoLinesOrSentWholeByTheirPrefix) {
 TEST_F(JavaCalls, ArgumentWordsBecomeNumbersOrTheTextsTheyAddress) {
     const std::string hundred(100, 'h');
     char unterminated[4] = {'a', 'b', 'c', 'd'};
-    struct Case {
-        U32 word;
-        bool ok;
-        std::string text;
-    } cases[] = {
+    struct Case { U32 word; bool ok; std::string text; } cases[] = {
         {0, true, "0"},
         {1000000, true, "1000000"},
         {1000001, false, ""},  // a text address, and no region holds it
@@ -101,10 +97,7 @@ TEST_F(JavaCalls, WithoutAJvmTheGeneralFunctionSendsNothingAndForwardedCallsGetN
 TEST_F(JavaCalls, WithoutAJvmEveryEngineFunctionSendsItsBoundedHeaderThenFailed) {
     using Fn = TMAAResult *(*)();
     const std::string normal = "Error in Eng_MaaStrNormalTest()::can't find class PrintDaemon\n";
-    struct Case {
-        Fn call;
-        std::string logged;
-    } cases[] = {
+    struct Case { Fn call; std::string logged; } cases[] = {
         {[] { return Eng_MaaStrIFOpt0(); }, normal},
         {[] { return Eng_MaaStrIFOpt5(1, 2, 3, 4, 5); }, normal},
         {[] { return Eng_MaaStrIFOpt1_Str(0); }, normal},

@@ -46,11 +46,7 @@ using Call = std::function<TMAAResult *()>;
 
 TEST_F(Panel, ClientTestsSendTheirRequestAndMapTheAnswer) {
     using Answers = std::vector<std::pair<std::string, std::string>>;  // answer, final record
-    struct Case {
-        Call call;
-        std::string request, header;
-        Answers answers;
-    } cases[] = {
+    struct Case { Call call; std::string request, header; Answers answers; } cases[] = {
         {[] { return UISSM_IF_KeyInTest_And_Cli(5); }, std::string("1\x05", 2), "[ UISSM_IF_KeyInTest : Argument=5 ]",
          {{"9", "KEY TEST DONE"}, {"x9", "KEY TEST FAIL"}}},
         {[] { return UISSM_IF_LED_Test_And_Cli(1); }, "2\x01", "[ UISSM_IF_LED_Test : Argument=1 ]",

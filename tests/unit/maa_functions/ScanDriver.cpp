@@ -137,10 +137,7 @@ TEST_F(ScanDriver, SFRReadWriteRefusesAnUnmappedAddressAndCutsALongText) {
 }
 
 TEST_F(ScanDriver, GetADFInfoReturnsTheMechanismForTheShellToWrite) {
-    struct Case {
-        std::function<void()> script;
-        Recs seen;
-    } cases[] = {
+    struct Case { std::function<void()> script; Recs seen; } cases[] = {
         {[] { vdev::SetADFMecha(3, 258, 2); }, {Cont("[ GetADFInfo ]"), End("ADFType=3 MultiType=2 Version=258", 1)}},
         {[] { vdev::SetPresent(vdev::kScanner, false); },
          {Cont("[ GetADFInfo ]"), End("critical error! failed to open scan device", 1)}},

@@ -78,12 +78,7 @@ TEST_F(Supplies, WithoutAVersionWordNothingIsUploaded) {
 TEST_F(Supplies, UploadSendsASpoolFileOrFailsWithThreeCharacters) {
     Put("/halvard/spool/tmp/upload.bin", std::string("a\0b", 3));
     std::filesystem::create_directories(root / "/halvard/spool/tmp/adir");
-    struct Case {
-        std::string name;
-        S32 result;
-        std::string message;
-        std::vector<std::string> writes;
-    } cases[] = {
+    struct Case { std::string name; S32 result; std::string message; std::vector<std::string> writes; } cases[] = {
         {"upload.bin", 0, "", {Transfer(MAA_FILE_TRANS_T2H, 3), std::string("a\0b", 3), Transfer(MAA_FILE_END, 0)}},
         {"missing.txt", -4, "Fil", {}},
         {"adir", -4, "Fil", {}},
@@ -100,9 +95,7 @@ TEST_F(Supplies, UploadSendsASpoolFileOrFailsWithThreeCharacters) {
 }
 
 TEST(CrumStrings, SizesOfTheStringFields) {
-    struct Case {
-        U32 unit, field, size;
-    } cases[] = {
+    struct Case { U32 unit, field, size; } cases[] = {
         {0, 19, 8},  {0, 20, 8},  {0, 27, 8},  {0, 28, 8},   {0, 29, 8},  {0, 30, 8},
         {0, 21, 16}, {0, 24, 16}, {0, 25, 16}, {26, 26, 16}, {0, 50, 16}, {0, 49, 4},
         {27, 19, 0}, {0xFFFFFFFF, 21, 0},      {0, 0, 0},    {0, 22, 0},  {0, 51, 0},

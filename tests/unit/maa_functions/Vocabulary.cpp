@@ -21,12 +21,7 @@ protected:
 };
 
 TEST_F(Vocabulary, NamesReachTheirFunctionsWithTheirHeaders) {
-    struct Case {
-        const char *line;
-        Recs records;
-        const char *logged;
-        std::vector<U32> pauses;
-    } cases[] = {
+    struct Case { const char *line; Recs records; const char *logged; std::vector<U32> pauses; } cases[] = {
         // A forwarded family, without the Java service.
         {"SysPBA_DramTest(1)", {Cont("[ GetRamSize ]"), End("Failed")}, "", {}},
         // The engine interface, not the toner sensor's first registration ("[ GetTonerSensorStatus ]").

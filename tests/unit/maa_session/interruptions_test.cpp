@@ -73,10 +73,7 @@ TEST_F(SessionSignals, DownloadArrivingInPiecesIsNotCutShort) {
 TEST_F(SessionTest, LineReaderDoesNotSpinOnAChannelThatGivesNothing) {
     const int closed = ::dup(fd);
     ::close(closed);
-    const struct {
-        const char *name;
-        int handle;
-    } rows[] = {{"hung up", fd}, {"closed", closed}};
+    const struct { const char *name; int handle; } rows[] = {{"hung up", fd}, {"closed", closed}};
     vdev::Reset();
     for (const auto &r : rows) {
         SCOPED_TRACE(r.name);

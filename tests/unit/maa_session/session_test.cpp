@@ -47,10 +47,7 @@ TEST_F(SessionTest, FirstWaitIsFiveMinutesLaterOnesFiveSeconds) {
 }
 
 TEST(CheckCommand, BalanceOfQuotesParenthesesAndBrackets) {
-    struct Row {
-        const char *line;
-        U32 ok;
-    } rows[] = {
+    struct Row { const char *line; U32 ok; } rows[] = {
         {"123", 0}, {"\t9x", 0}, {"x9", 1}, {"  f(1)", 1}, {"f(1;", 0}, {"f(\"(\")", 0},
         {"f(1); g(2)", 1}, {"f(1;2)", 0}, {"a[1] = f(2)", 1}, {"f[1)", 0}, {")(", 1},
         {"\"a\" \"b\"", 1}, {"", 1},
@@ -59,11 +56,7 @@ TEST(CheckCommand, BalanceOfQuotesParenthesesAndBrackets) {
 }
 
 TEST_F(SessionTest, LineEndsAtCrLfOrTheLimitAndTakesEightRawBytesBehindAHash) {
-    struct Row {
-        const char *name;
-        std::string sent;
-        std::vector<std::string> lines;
-    } rows[] = {
+    struct Row { const char *name; std::string sent; std::vector<std::string> lines; } rows[] = {
         {"CR and LF", "ab\r\ncd\n", {"ab", "", "cd"}},
         {"limit", std::string(1030, 'a') + "\r", {std::string(1025, 'a'), "aaaaa"}},
         {"hash, raw CR last", S("x#\r\n\0y\0\0\0\rz\r"), {S("x#\r\n\0y\0\0\0\r"), "z"}},
