@@ -4,6 +4,7 @@
 #pragma once
 
 #include <sys/socket.h>
+#include <unistd.h>
 
 #include <fstream>
 #include <optional>
@@ -80,12 +81,26 @@ inline std::string ReadFile(const std::string &path) {
     ss << std::ifstream(path, std::ios::binary).rdbuf();
     return ss.str();
 }
-// A packet socket keeps each of the device's writes apart: one string each.
-inline std::vector<std::string> Writes(int fd) {
-    std::vector<std::string> out;
-    std::string buf(1 << 16, '\0');
-    for (ssize_t n; (n = ::recv(fd, buf.data(), buf.size(), MSG_DONTWAIT)) >= 0;) out.push_back(buf.substr(0, n));
-    return out;
-}
+// The session's channel as a packet socket pair: the device writes on
+// `device`, and each of its writes is read back apart, one string each.
+struct PacketChannel {
+    int device = -1, host = -1;
+    PacketChannel() {
+        int sp[2];
+        if (::socketpair(AF_UNIX, SOCK_SEQPACKET, 0, sp) == 0) device = sp[0], host = sp[1];
+    }
+    ~PacketChannel() {
+        ::close(device);
+        ::close(host);
+    }
+    PacketChannel(const PacketChannel &) = delete;
+    PacketChannel &operator=(const PacketChannel &) = delete;
+    std::vector<std::string> Writes() const {
+        std::vector<std::string> out;
+        std::string buf(1 << 16, '\0');
+        for (ssize_t n; (n = ::recv(host, buf.data(), buf.size(), MSG_DONTWAIT)) >= 0;) out.push_back(buf.substr(0, n));
+        return out;
+    }
+};
 
 }  // namespace maarec

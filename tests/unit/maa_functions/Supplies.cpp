@@ -27,17 +27,12 @@ class Supplies : public FnTest {
 protected:
     void SetUp() override {
         FnTest::SetUp();
-        ASSERT_EQ(::socketpair(AF_UNIX, SOCK_SEQPACKET, 0, sp), 0);
-        ulDrvHandle = static_cast<U32>(sp[0]);
+        ASSERT_GE(packets.device, 0);
+        ulDrvHandle = static_cast<U32>(packets.device);
         std::filesystem::create_directories(root / "/halvard/sys/portability/printdid");
     }
-    void TearDown() override {
-        ::close(sp[0]);
-        ::close(sp[1]);
-        FnTest::TearDown();
-    }
     void Put(const char *fixed, const std::string &bytes) { std::ofstream(root / fixed, std::ios::binary) << bytes; }
-    int sp[2] = {-1, -1};
+    PacketChannel packets;
 };
 
 TEST_F(Supplies, ReportHoldsTheDataVersionLineAndIsUploaded) {
@@ -45,7 +40,7 @@ TEST_F(Supplies, ReportHoldsTheDataVersionLineAndIsUploaded) {
     Put(kSupplies, raw);
     EXPECT_EQ(Seen(Get_SuppliesInfo_Report()), (Recs{Cont("[ GetSuppliesInfoReport ]"), End("Data Upload Complete")}));
     EXPECT_EQ(ReadFile(root / kReport), line);
-    EXPECT_EQ(Writes(sp[1]), (std::vector<std::string>{Transfer(MAA_FILE_TRANS_T2H, line.size()), line,
+    EXPECT_EQ(packets.Writes(), (std::vector<std::string>{Transfer(MAA_FILE_TRANS_T2H, line.size()), line,
                                                        Transfer(MAA_FILE_END, 0)}));
     // The whole record is loaded, in the file's byte order.
     EXPECT_EQ(std::memcmp(&gstSuppliesInfoData, raw.data(), raw.size()), 0);
@@ -70,7 +65,7 @@ TEST_F(Supplies, WithoutAVersionWordNothingIsUploaded) {
         Put(kReport, "DataVersion = 0x00000001\r\n");  // an earlier run's report
         written.clear();
         EXPECT_EQ(Seen(Get_SuppliesInfo_Report()), (Recs{Cont("[ GetSuppliesInfoReport ]"), End("Fil")}));
-        EXPECT_TRUE(Writes(sp[1]).empty());
+        EXPECT_TRUE(packets.Writes().empty());
         EXPECT_FALSE(std::filesystem::exists(root / kReport));
     }
 }
@@ -90,7 +85,7 @@ TEST_F(Supplies, UploadSendsASpoolFileOrFailsWithThreeCharacters) {
         char message[MAA_UPLOAD_MESSAGE_SIZE] = {};
         EXPECT_EQ(UploadFileData(c.name.c_str(), message), c.result);
         EXPECT_EQ(std::string(message), c.message);
-        EXPECT_EQ(Writes(sp[1]), c.writes);
+        EXPECT_EQ(packets.Writes(), c.writes);
     }
 }
 

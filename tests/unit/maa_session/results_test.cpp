@@ -19,8 +19,8 @@ namespace {
 class ResultTest : public ::testing::Test {
 protected:
     void SetUp() override {
-        ASSERT_EQ(::socketpair(AF_UNIX, SOCK_SEQPACKET, 0, sp), 0);
-        ulDrvHandle = static_cast<U32>(sp[0]);
+        ASSERT_GE(channel.device, 0);
+        ulDrvHandle = static_cast<U32>(channel.device);
         IsDisconnected = 0;
         enSpecialMode = MAA_NORMAL_CMD;
         MAA_AddrReset();
@@ -28,15 +28,13 @@ protected:
         LoggerHost_StartCapture();
     }
     void TearDown() override {
-        ::close(sp[0]);
-        ::close(sp[1]);
         IsDisconnected = 0;
         enSpecialMode = MAA_NORMAL_CMD;
         MAA_SetResultWriter(nullptr);
         LoggerHost_StopCapture();
     }
-    std::vector<std::string> Writes() { return maarec::Writes(sp[1]); }
-    int sp[2] = {-1, -1};
+    std::vector<std::string> Writes() { return channel.Writes(); }
+    PacketChannel channel;
 };
 
 TEST_F(ResultTest, FramesAndTheirWrites) {
