@@ -35,7 +35,8 @@ struct Shell {
 
     void Load() {
         using hidden::Function;
-        SetResultWriter = Function<void(void (*)(const TMAAResult *))>("MAA_SetResultWriter(void (*)(TMAAResult const*))");
+        using Writer = void (*)(const TMAAResult *);
+        SetResultWriter = Function<void(Writer)>("MAA_SetResultWriter(void (*)(TMAAResult const*))");
         SetCmdString = Function<void(const U8 *)>("MAA_SetCmdString(unsigned char const*)");
         SetCmdName = Function<void(const U8 *)>("MAA_SetCmdName(unsigned char const*)");
         SetMachineName = Function<void(const char *)>("MAA_SetMachineName(char const*)");

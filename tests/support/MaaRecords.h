@@ -67,7 +67,9 @@ inline std::string Frame(U32 st, U32 res, const std::string &data, std::optional
 // The device's acknowledgement of the start and stop commands.
 inline const std::string kAck("\x1bwMAA-OK", 8);
 // A special command line, host to device.
-inline std::string Special(U8 code, U32 size) { return std::string("#$%") + static_cast<char>(code) + BE32(size) + "\r"; }
+inline std::string Special(U8 code, U32 size) {
+    return std::string("#$%") + static_cast<char>(code) + BE32(size) + "\r";
+}
 // A file-transfer frame, device to host.
 inline std::string Transfer(U8 op, U32 size) { return std::string("#$%") + static_cast<char>(op) + BE32(size) + BE32(size); }
 // Recognisable bytes.

@@ -45,46 +45,40 @@ TEST_F(ResultTest, FramesAndTheirWrites) {
     forwarded = Frame(1, 2, "xy");
     auto text = [](std::string &s) { return reinterpret_cast<U8 *>(s.data()); };
     auto size = [](const std::string &s) { return static_cast<U32>(s.size()); };
-    struct Row {
-        const char *name;
-        TMAASpecialMode mode;
-        std::function<void()> action;
-        std::vector<std::string> writes;
-    } rows[] = {
-        {"result without data", MAA_NORMAL_CMD,
-         [] { TMAAResult r{MAA_RESULT_END, 7, 0, nullptr}; MAA_WriteResult(&r); }, {Frame(1, 7, "")}},
-        {"result with text", MAA_NORMAL_CMD,
-         [&] { TMAAResult r{MAA_RESULT_CONTINUE, 0, 5, text(hello)}; MAA_IF_WriteResult(&r); },
+    auto Forward = [&](std::string &s) {
+        TMAAResult r{MAA_RESULT_CONTINUE, 0, size(s), text(s)};
+        MAA_WriteResultForward(&r);
+    };
+    struct Row { const char *name; std::function<void()> action; std::vector<std::string> writes; } rows[] = {
+        {"result without data", [] { TMAAResult r{MAA_RESULT_END, 7, 0, nullptr}; MAA_WriteResult(&r); },
+         {Frame(1, 7, "")}},
+        {"result with text", [&] { TMAAResult r{MAA_RESULT_CONTINUE, 0, 5, text(hello)}; MAA_IF_WriteResult(&r); },
          {Frame(0, 0, hello).substr(0, 12), hello}},
-        {"skip", MAA_NORMAL_CMD, [] { MAA_IF_SkipResult(); }, {std::string(12, '\0')}},
-        {"file end", MAA_NORMAL_CMD, [] { MAA_IF_FileEnd(); }, {Transfer(0xA0, 0)}},
-        {"file of 10000 bytes", MAA_NORMAL_CMD, [&] { MAA_IF_WriteFile(text(file), size(file)); },
+        {"skip", [] { MAA_IF_SkipResult(); }, {std::string(12, '\0')}},
+        {"file end", [] { MAA_IF_FileEnd(); }, {Transfer(0xA0, 0)}},
+        {"file of 10000 bytes", [&] { MAA_IF_WriteFile(text(file), size(file)); },
          {Transfer(1, 10000), file.substr(0, 4096), file.substr(4096, 4096), file.substr(8192)}},
-        {"scanner file", MAA_NORMAL_CMD, [&] { MAA_Scanner_WriteFile(text(file), 5000); },
+        {"scanner file", [&] { MAA_Scanner_WriteFile(text(file), 5000); },
          {file.substr(0, 4096), file.substr(4096, 904)}},
-        {"forwarded frames", MAA_NORMAL_CMD,
-         [&] { TMAAResult r{MAA_RESULT_CONTINUE, 0, size(mixed), text(mixed)}; MAA_WriteResultForward(&r); },
-         {mixed.substr(0, 12), "abc", Transfer(1, 5000), file.substr(0, 4096), file.substr(4096, 904), Transfer(0xA0, 0),
-          Transfer(1, 5), Frame(1, 1, "")}},
-        {"forwarded frame cut short", MAA_NORMAL_CMD,
-         [&] { TMAAResult r{MAA_RESULT_CONTINUE, 0, size(cut), text(cut)}; MAA_WriteResultForward(&r); },
-         {cut.substr(0, 12), "xxxxx"}},
-        {"file forward", MAA_NORMAL_CMD, [&] { MAA_WriteFileForward(text(forwarded), size(forwarded)); },
+        {"forwarded frames", [&] { Forward(mixed); },
+         {mixed.substr(0, 12), "abc", Transfer(1, 5000), file.substr(0, 4096), file.substr(4096, 904),
+          Transfer(0xA0, 0), Transfer(1, 5), Frame(1, 1, "")}},
+        {"forwarded frame cut short", [&] { Forward(cut); }, {cut.substr(0, 12), "xxxxx"}},
+        {"file forward", [&] { MAA_WriteFileForward(text(forwarded), size(forwarded)); },
          {forwarded.substr(0, 12), "xy"}},
-        {"acknowledgement", MAA_NORMAL_CMD, [] { MAA_ResponseOK(); }, {kAck}},
-        {"auto run", MAA_AUTO_RUN_CMD,
+        {"acknowledgement", [] { MAA_ResponseOK(); }, {kAck}},
+        {"auto run",
          [&] {
+             enSpecialMode = MAA_AUTO_RUN_CMD;
              TMAAResult r{MAA_RESULT_END, 1, 5, text(hello)};
              MAA_WriteResult(&r);
              MAA_IF_SkipResult();
-             r = {MAA_RESULT_CONTINUE, 0, size(forwarded), text(forwarded)};
-             MAA_WriteResultForward(&r);
+             Forward(forwarded);
          },
          {}},
     };
     for (const Row &r : rows) {
         SCOPED_TRACE(r.name);
-        enSpecialMode = r.mode;
         r.action();
         EXPECT_EQ(Writes(), r.writes);
     }
