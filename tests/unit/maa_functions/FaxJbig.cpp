@@ -72,8 +72,8 @@ TEST_F(FaxJbig, FailedStepsAreNamedAndTheLockIsNeverLeftHeld) {
         {[] { vdev::SetPresent(vdev::kScanner, false); }, "critical error! failed to open scan device", 0, 0, 0},
         {[] { vdev::SetScanLockDefault(0); }, "scanner is busy or in sleep", 31, 0, 0},
         {[] { vdev::SetPresent(vdev::kFax, false); }, "critical error! failed to open fax device", 1, 1, 0},
-        {[] { vdev::SetFaxTestAnswer({"x", std::nullopt, 1, 4}); }, "critical error! failed to control fax device", 1, 1,
-         1},
+        {[] { vdev::SetFaxTestAnswer({"x", std::nullopt, 1, 4}); }, "critical error! failed to control fax device",
+         1, 1, 1},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.text);

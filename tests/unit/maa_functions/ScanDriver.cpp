@@ -66,6 +66,7 @@ TEST_F(ScanDriver, TheRecordCarriesTheBufferJobAndLine) {
 
 TEST_F(ScanDriver, FailuresAreOneRecordAndTheLockIsNeverLeftHeld) {
     const std::vector<unsigned long> thirtyOneLocks(31, IOCNR_SCAN_APP_LOCK);  // never released, never tested
+    const std::string failedControl = "critical error! failed to control device";
     struct Case {
         std::function<void()> script;
         std::string text;
@@ -73,8 +74,8 @@ TEST_F(ScanDriver, FailuresAreOneRecordAndTheLockIsNeverLeftHeld) {
         size_t pauses;
     } cases[] = {
         {[] { vdev::SetScanLockDefault(0); }, "scanner is busy or in sleep", thirtyOneLocks, 30},
-        {[] { Answer("never sent", std::nullopt, 5); }, "critical error! failed to control device", kLockTestRelease, 0},
-        {[] { Answer("never sent", std::nullopt, -EIO); }, "critical error! failed to control device", kLockTestRelease, 0},
+        {[] { Answer("never sent", std::nullopt, 5); }, failedControl, kLockTestRelease, 0},
+        {[] { Answer("never sent", std::nullopt, -EIO); }, failedControl, kLockTestRelease, 0},
         {[] { vdev::SetPresent(vdev::kScanner, false); }, "critical error! failed to open scan device", {}, 0},
     };
     for (const Case &c : cases) {

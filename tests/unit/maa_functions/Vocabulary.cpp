@@ -25,7 +25,8 @@ TEST_F(Vocabulary, NamesReachTheirFunctionsWithTheirHeaders) {
         // A forwarded family, without the Java service.
         {"SysPBA_DramTest(1)", {Cont("[ GetRamSize ]"), End("Failed")}, "", {}},
         // The engine interface, not the toner sensor's first registration ("[ GetTonerSensorStatus ]").
-        {"Get_TonerSensorStatus(1)", {Cont("[ Get_TonerSensorStatus ]"), End("Failed")}, "[Eng_MaaStrNormalTest] Start===>", {}},
+        {"Get_TonerSensorStatus(1)", {Cont("[ Get_TonerSensorStatus ]"), End("Failed")},
+         "[Eng_MaaStrNormalTest] Start===>", {}},
         // Delay pauses for its argument up to a minute.
         {"Delay_ms(250)", {End("Delay 250 ms DONE")}, "", {250}},
         {"Delay_ms(0xFFFFFFFF)", {End("Delay 60000 ms DONE")}, "", {60000}},
