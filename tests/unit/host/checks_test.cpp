@@ -12,13 +12,10 @@ namespace {
 
 TEST(CheckDownloadSize, RefusesWhatTheSizeFieldCannotHold) {
     struct Row { uint64_t size; bool refused; } rows[] = {
-        {0, false},
-        {1, false},
-        {0xFFFFFFFFull, false},
+        {0, false}, {1, false}, {0xFFFFFFFFull, false},
         {0x100000000ull, true},  // 4 GiB would go out as 0
         {0x100000005ull, true},  // ... and this as 5
-        {5ull << 30, true},
-        {UINT64_MAX, true},
+        {5ull << 30, true}, {UINT64_MAX, true},
     };
     for (const Row &r : rows) {
         SCOPED_TRACE(r.size);

@@ -90,13 +90,9 @@ protected:
     void Device(std::function<void(int)> play) { device = std::thread(std::move(play), sp[1]); }
     // The device writes these bytes in pieces of `piece` bytes, each its own write.
     void DeviceSends(std::string bytes, size_t piece = 0) {
-        Device([bytes = std::move(bytes), piece](int fd) {
-            if (piece == 0) {
-                SendAll(fd, bytes);
-                return;
-            }
-            for (size_t at = 0; at < bytes.size(); at += piece) {
-                if (!SendAll(fd, bytes.substr(at, piece))) return;
+        Device([bytes = std::move(bytes), step = piece ? piece : std::string::npos](int fd) {
+            for (size_t at = 0; at < bytes.size(); at += step) {
+                if (!SendAll(fd, bytes.substr(at, step))) return;
                 std::this_thread::sleep_for(std::chrono::microseconds(200));
             }
         });

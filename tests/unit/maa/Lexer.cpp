@@ -47,19 +47,13 @@ constexpr U32 I = IDENTIFIER;
 // Operators take the longest match; a name beginning with a type word is that type word.
 TEST_F(Lexer, TokensOfALine) {
     struct Case { const char *text; std::vector<U32> expected; } cases[] = {
-        {"a|&b", {I, LOR, I}},
-        {"a||b", {I, '|', '|', I}},
-        {"x<<=2", {I, LSE, CONSTANT}},
-        {"x<<2", {I, LS, CONSTANT}},
+        {"a|&b", {I, LOR, I}}, {"a||b", {I, '|', '|', I}}, {"x<<=2", {I, LSE, CONSTANT}}, {"x<<2", {I, LS, CONSTANT}},
         {"x>>=2 x>>2 x>=2 x<=2", {I, RSE, CONSTANT, I, RS, CONSTANT, I, GE, CONSTANT, I, LE, CONSTANT}},
         {"== != += ++ -= -- *= /= %= ^= &= && |=", {EQ, NE, PE, PP, ME, MM, TE, DE, RE, EXE, AE, LAND, OE}},
-        {"+++", {PP, '+'}},
+        {"+++", {PP, '+'}}, {" \t\v\f\r\n x", {I}}, {"integer", {R_INT}},
         {"( ) , : ; ? ~ ! % & * + - / < = > ^ |",
          {'(', ')', ',', ':', ';', '?', '~', '!', '%', '&', '*', '+', '-', '/', '<', '=', '>', '^', '|'}},
-        {" \t\v\f\r\n x", {I}},
-        {"integer", {R_INT}},
-        {"longitude chart shortcut int", {R_LONG, R_CHAR, R_SHORT, R_INT}},
-        {"Int in_1x _9", {I, I, I}},
+        {"longitude chart shortcut int", {R_LONG, R_CHAR, R_SHORT, R_INT}}, {"Int in_1x _9", {I, I, I}},  // names last
     };
     for (const Case &c : cases) EXPECT_EQ(tokens(c.text), c.expected) << c.text;
     EXPECT_EQ(names, (std::vector<std::string>{"Int", "in_1x", "_9"}));

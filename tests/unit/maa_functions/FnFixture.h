@@ -9,6 +9,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <list>
 #include <string>
 #include <vector>
 
@@ -82,6 +83,11 @@ protected:
         MAA_InputSet(reinterpret_cast<const U8 *>(kept.c_str()));
         return MAA_Parser();
     }
+    // The address of a copy of `text` in the shell's map, NUL included.
+    U32 Map(const std::string &text) {
+        std::string &kept = texts_.emplace_back(text);
+        return MAA_AddrMap(kept.data(), static_cast<U32>(kept.size() + 1));
+    }
     // Bytes the device sent on the session's channel other than by the writer.
     static std::string Wire() {
         std::vector<uint8_t> b = vdev::HostRead(vdev::kPrn);
@@ -90,6 +96,7 @@ protected:
 
     TempRoot root;
     int channel = -1;
+    std::list<std::string> texts_;  // stable addresses for the map
 };
 
 }  // namespace fntest

@@ -2,7 +2,6 @@
 // argument texts, reply forms and line splitting as the host sees them, and a
 // clean end when there is no JVM behind them.
 #include <cstring>
-#include <list>
 
 #include "maa/functions/MAA_EngineIF.h"
 #include "maa/functions/MAA_General.h"
@@ -11,15 +10,7 @@
 namespace fntest {
 namespace {
 
-class JavaCalls : public FnTest {
-protected:
-    // The address of a copy of `text` in the shell's map, NUL included.
-    U32 Map(const std::string &text) {
-        std::string &kept = texts_.emplace_back(text);
-        return MAA_AddrMap(kept.data(), static_cast<U32>(kept.size() + 1));
-    }
-    std::list<std::string> texts_;  // stable addresses for the map
-};
+using JavaCalls = FnTest;
 
 TEST_F(JavaCalls, RepliesAreSplitIntoLinesOrSentWholeByTheirPrefix) {
     const std::string x100(100, 'x'), w200(200, 'w');

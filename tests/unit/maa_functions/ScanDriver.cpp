@@ -121,9 +121,8 @@ TEST_F(ScanDriver, OnlyTheReportedCountIsSentAndNeverMoreThanTheBuffer) {
 }
 
 TEST_F(ScanDriver, SFRReadWriteRefusesAnUnmappedAddressAndCutsALongText) {
-    char text[] = "REG_A";
-    const U32 addr = MAA_AddrMap(text, sizeof text);
-    for (U32 bad : {0u, kMax, addr + static_cast<U32>(sizeof text), 0x00100000u}) {
+    const U32 addr = Map("REG_A");
+    for (U32 bad : {0u, kMax, addr + 6, 0x00100000u}) {
         SCOPED_TRACE(bad);
         Restart();
         EXPECT_EQ(Seen(SFRReadWrite(1, bad, 2)), (Recs{End("critical error! invalid text argument", 0),
@@ -132,7 +131,7 @@ TEST_F(ScanDriver, SFRReadWriteRefusesAnUnmappedAddressAndCutsALongText) {
     }
     std::string longText(400, 't');
     Answer(Frame(MAA_RESULT_END, 1, "ok"));
-    SFRReadWrite(1, MAA_AddrMap(longText.data(), static_cast<U32>(longText.size() + 1)), 2);
+    SFRReadWrite(1, Map(longText), 2);
     EXPECT_EQ(vdev::ScanCommands(),
               std::vector<std::string>{("SFRReadWrite(1,\"" + longText).substr(0, SCAN_MAA_COMMAND_LENGTH - 1)});
 }
