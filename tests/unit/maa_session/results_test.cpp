@@ -16,6 +16,19 @@
 namespace maasession {
 namespace {
 
+// Runs `body` in a child that a hang cannot outlive (it is killed after
+// `seconds`); the child's exit code, or -1 when it did not exit by itself.
+int InChild(const std::function<int()> &body, unsigned seconds) {
+    const pid_t pid = ::fork();
+    if (pid == 0) {
+        ::alarm(seconds);
+        std::_Exit(body());
+    }
+    int status = 0;
+    if (pid < 0 || ::waitpid(pid, &status, 0) != pid) return -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
 class ResultTest : public ::testing::Test {
 protected:
     void SetUp() override {
@@ -139,20 +152,8 @@ TEST_F(ResultTest, DumpFileRefusesWhatIsNoTextFileAndStopsWhenTheHostIsGone) {
     for (std::string path : {"/halvard/zero", "/halvard/fifo"}) {
         SCOPED_TRACE(path);
         const U32 address = MAA_AddrMap(path.data(), static_cast<U32>(path.size() + 1));
-        const pid_t pid = ::fork();
-        ASSERT_GE(pid, 0);
-        if (pid == 0) {
-            ::alarm(5);
-            TMAAResult *res = Dump_File(address);
-            const bool refused = res != nullptr && res->ulResult == 0 && res->enContinue == MAA_RESULT_END &&
-                                 std::string(reinterpret_cast<char *>(res->pubData), res->ulDataSize) ==
-                                     "File Open Error " + path;
-            ::_exit(refused ? 0 : 1);
-        }
-        int status = 0;
-        ASSERT_EQ(::waitpid(pid, &status, 0), pid);
-        EXPECT_FALSE(WIFSIGNALED(status)) << "still dumping after 5 s";
-        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "not answered with the open error";
+        EXPECT_EQ(InChild([&] { return Of(Dump_File(address)) == End("File Open Error " + path, 0) ? 0 : 1; }, 5), 0)
+            << "-1: still dumping after 5 s, 1: not answered with the open error";
         EXPECT_TRUE(Writes().empty());
         MAA_AddrUnmap(address);
     }
@@ -202,9 +203,7 @@ TEST(StartUp, SerialStringIsFollowedByTheModelSeries) {
 // thread. Run in a child: the reader never ends.
 TEST(StartUp, CompEntryOpensTheShellQueueAndStartsTheReader) {
     TempRoot root;
-    const pid_t pid = ::fork();
-    ASSERT_GE(pid, 0);
-    if (pid == 0) {
+    const int status = InChild([&] {
         const bool existed = ::msgget(1234, 0) >= 0;
         int code = MAA_CompEntry(0) == 1 ? 0 : 1;
         for (int i = 0; i < 500 && !startreading_enter; ++i) std::this_thread::sleep_for(std::chrono::milliseconds(10));
@@ -212,17 +211,9 @@ TEST(StartUp, CompEntryOpensTheShellQueueAndStartsTheReader) {
         if (ulMAAMsgQueueID < 0 || ulMAAMsgQueueID != ::msgget(1234, 0)) code |= 4;
         if (ReadFile(root / "/halvard/sys/statusinfo/usb_speed.txt") != "HIGH") code |= 8;
         if (!existed) ::msgctl(ulMAAMsgQueueID, IPC_RMID, nullptr);
-        std::_Exit(code);
-    }
-    int status = -1;
-    for (int i = 0; i < 1000 && ::waitpid(pid, &status, WNOHANG) == 0; ++i)
-        std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    if (status == -1) {
-        ::kill(pid, SIGKILL);
-        ::waitpid(pid, &status, 0);
-    }
-    ASSERT_TRUE(WIFEXITED(status));
-    EXPECT_EQ(WEXITSTATUS(status), 0) << "1 entry result, 2 reader, 4 queue, 8 usb_speed.txt";
+        return code;
+    }, 10);
+    EXPECT_EQ(status, 0) << "-1 hung, 1 entry result, 2 reader, 4 queue, 8 usb_speed.txt";
 }
 
 }  // namespace
