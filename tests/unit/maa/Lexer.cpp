@@ -9,10 +9,6 @@ namespace {
 
 class Lexer : public ShellTest {
 protected:
-    void TearDown() override {
-        MAA_FreeParamString();
-        ShellTest::TearDown();
-    }
     // Every token code up to (not including) the end; identifier texts go to names.
     static std::vector<U32> tokens(const char *line) {
         lineBuffer = line;

@@ -3,20 +3,13 @@
 // files they read under a private root.
 #include <filesystem>
 
-#include "maa/functions/MAA_CpuTemp.h"
 #include "maa_functions/FnFixture.h"
 #include "print/USBPrint.h"
 
 namespace fntest {
 namespace {
 
-class CpuTemp : public FnTest {
-protected:
-    void TearDown() override {
-        MAA_SetMachineName(nullptr);
-        FnTest::TearDown();
-    }
-};
+using CpuTemp = FnTest;
 
 TEST_F(CpuTemp, FanTestsRunTheirCommandsAndReadTheStatusFiles) {
     const std::string fanTest = root / "/proc/cpufantest", fanStatus = root / "/proc/fanstatus";

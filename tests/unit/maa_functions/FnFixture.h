@@ -21,6 +21,8 @@
 #include "maa/MAA_Parser.h"
 #include "maa/MAA_Symbol.h"
 #include "maa/MAA_Result.h"
+#include "maa/functions/MAA_CpuTemp.h"
+#include "maa/functions/MAA_Panel.h"
 #include "maa/functions/MAA_SysResult.h"
 #include "support/MaaRecords.h"
 #include "support/TempRoot.h"
@@ -50,6 +52,7 @@ protected:
         MAA_SetResultWriter(&Capture);
         MAA_SetCommandRunner(&RecordCommand);
         MAA_SetSleeper(&RecordSleep);
+        MAA_PanelSetWaits(50, 50, 50);  // no UI server answers unless a test starts one
         LoggerHost_StartCapture();
         Restart();
         ASSERT_GT(channel, 0);
@@ -62,6 +65,8 @@ protected:
         MAA_SetCommandRunner(nullptr);
         MAA_SetSleeper(nullptr);
         MAA_SetCmdString(nullptr);
+        MAA_SetMachineName(nullptr);
+        MAA_PanelSetWaits(0, 0, 0);
         MAA_SymbolClear();
         LoggerHost_StopCapture();
     }

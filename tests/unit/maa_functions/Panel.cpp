@@ -6,7 +6,6 @@
 #include <filesystem>
 
 #include "UiPeer.h"
-#include "maa/functions/MAA_Panel.h"
 #include "maa_functions/FnFixture.h"
 
 namespace fntest {
@@ -24,7 +23,6 @@ protected:
     }
     void TearDown() override {
         ::unsetenv("USBADAPTER_UI_PORT");
-        MAA_PanelSetWaits(0, 0, 0);
         FnTest::TearDown();
     }
 

@@ -1,24 +1,12 @@
 // Calling the registered vocabulary through the shell the way a host script
 // does: names that reach a family's shared function, and every name called
 // with hostile arguments.
-#include "maa/functions/MAA_Panel.h"
-#include "maa/functions/MAA_SysResult.h"
 #include "maa_functions/FnFixture.h"
 
 namespace fntest {
 namespace {
 
-class Vocabulary : public FnTest {
-protected:
-    void SetUp() override {
-        FnTest::SetUp();
-        MAA_PanelSetWaits(50, 50, 50);  // no UI server answers here
-    }
-    void TearDown() override {
-        MAA_PanelSetWaits(0, 0, 0);
-        FnTest::TearDown();
-    }
-};
+using Vocabulary = FnTest;
 
 TEST_F(Vocabulary, NamesReachTheirFunctionsWithTheirHeaders) {
     struct Case { const char *line; Recs records; const char *logged; std::vector<U32> pauses; } cases[] = {

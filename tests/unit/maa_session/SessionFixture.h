@@ -23,6 +23,7 @@
 #include "maa/MAA_MM.h"
 #include "maa/MAA_Result.h"
 #include "maa/MAA_Symbol.h"
+#include "print/PrintRecorder.h"
 #include "support/MaaRecords.h"
 #include "vdev.h"
 #include "vendor/VLX_Main.h"
@@ -137,6 +138,23 @@ protected:
     }
 
     int fd = -1;
+};
+
+// The whole road through the print reader and the classifier.
+class SessionRoad : public ReaderTest {
+protected:
+    void SetUp() override {
+        ReaderTest::SetUp();
+        IsDisconnected = 0;
+        MAA_SymbolClear();
+        probes.clear();
+        MAA_SymbolAdd(ftarget_ppc, "probe", MAA_SYM_FUNC, MAA_FuncEntry<probe>(), 1);
+    }
+    void TearDown() override {
+        MAA_SymbolClear();
+        MAA_SetResultWriter(nullptr);
+        ReaderTest::TearDown();
+    }
 };
 
 }  // namespace maasession

@@ -92,17 +92,9 @@ TEST_F(SessionTest, LineReaderDoesNotSpinOnAChannelThatGivesNothing) {
 
 // ---- through the reader: a cable pulled in the middle of a start command -------
 
-class StartCommandPull : public ReaderTest {
-protected:
-    void TearDown() override {
-        MAA_SetResultWriter(nullptr);
-        ReaderTest::TearDown();
-    }
-};
-
 // The bridge loses what the host had in flight when the cable goes, so no rest
 // of the start command is read as the beginning of the next job.
-TEST_F(StartCommandPull, NextPrintJobAfterReplugIsByteExact) {
+TEST_F(SessionRoad, StartCommandPulledMidwayLeavesTheNextPrintJobByteExact) {
     const std::string start = "\x1bwMAASTART";
     const std::string job = kUel + "@PJL JOB\r\npage" + kUel;
     LoggerHost_StopCapture();

@@ -3,7 +3,6 @@
 #include <thread>
 
 #include "maa_session/SessionFixture.h"
-#include "print/PrintRecorder.h"
 #include "support/WaitUntil.h"
 
 namespace maasession {
@@ -222,22 +221,6 @@ TEST_F(SessionTest, DriverLayerReadsWhatIsAskedUpToAPieceAndHidesWriteErrorsButN
 }
 
 // ---- the whole road through the print reader and the classifier -------------------
-
-class SessionRoad : public ReaderTest {
-protected:
-    void SetUp() override {
-        ReaderTest::SetUp();
-        IsDisconnected = 0;
-        MAA_SymbolClear();
-        probes.clear();
-        MAA_SymbolAdd(ftarget_ppc, "probe", MAA_SYM_FUNC, MAA_FuncEntry<probe>(), 1);
-    }
-    void TearDown() override {
-        MAA_SymbolClear();
-        MAA_SetResultWriter(nullptr);
-        ReaderTest::TearDown();
-    }
-};
 
 TEST_F(SessionRoad, WrongStartCommandIsPrintData) {
     Send({"\x1bwMAASTARX", "rest of the job"});
