@@ -131,15 +131,10 @@ TEST_F(ResultTest, DumpFileSendsLinesUntilTheFirstEmptyOne) {
         if (r.content) std::ofstream(root / path) << r.content;
         TMAAResult *res = Dump_File(address);
         std::vector<std::string> want;
-        for (const std::string &l : r.lines) {
-            want.push_back(BE32(0) + BE32(0) + BE32(static_cast<U32>(l.size())));
-            want.push_back(l);
-        }
+        for (const std::string &l : r.lines) want.insert(want.end(), {Frame(0, 0, l).substr(0, 12), l});
         EXPECT_EQ(Writes(), want);
         ASSERT_NE(res, nullptr);
-        EXPECT_EQ(res->enContinue, MAA_RESULT_END);
-        EXPECT_EQ(res->ulResult, r.result);
-        EXPECT_EQ(std::string(reinterpret_cast<char *>(res->pubData), res->ulDataSize), r.last);
+        EXPECT_EQ(Of(res), End(r.last, r.result));
     }
 }
 
