@@ -1,5 +1,6 @@
 // Evaluation: assignments, operators, casts and memory access through the
 // address map, and the call operator with its result writing.
+#include <sstream>
 #include <string>
 
 #include "maa/MAA_Executor.h"
@@ -178,13 +179,13 @@ TEST_F(Evaluator, CallsAndTheRecordsTheyWrite) {
         enSpecialMode = c.mode;
         const std::string value = eval(c.line);
         if (c.value) { EXPECT_EQ(value, c.value); }
-        std::string called;
+        std::ostringstream called;
         for (const Call &call : calls) {
-            called += std::string(called.empty() ? "" : " ") + call.function + "(";
-            for (size_t i = 0; i < call.words.size(); ++i) called += (i ? "," : "") + std::to_string(call.words[i]);
-            called += ")";
+            called << (&call == &calls.front() ? "" : " ") << call.function << '(';
+            for (size_t i = 0; i < call.words.size(); ++i) called << (i ? "," : "") << call.words[i];
+            called << ')';
         }
-        EXPECT_EQ(called, c.called);
+        EXPECT_EQ(called.str(), c.called);
         EXPECT_EQ(written, c.written);
         if (c.logged) { EXPECT_EQ(LoggerHost_Count(c.logged), 1); }
     }
