@@ -1,7 +1,10 @@
-// The test functions that go to Java, in the library the JVM loaded: the engine
+// The test functions that go to Java, in the library the JVM loaded: the CPU
+// temperature recording and the panel switch on the print daemon, the engine
 // string interface on the print daemon and the general function on the MAA
 // object. What Java receives (the fixtures' journal), what the host receives
-// (the records), and that no Java failure leaves an exception pending.
+// (the records), and that no Java failure or local reference is left behind
+// (-Xcheck:jni fails the test on a pending exception or a local-reference
+// overflow).
 #include <jni.h>
 
 #include <atomic>
@@ -16,47 +19,57 @@ namespace {
 
 using namespace maarec;
 
-// The library's shell functions, found once Java has loaded it.
+// The library's shell functions, found once Java has loaded it (a missing one
+// fails the test).
 struct Shell {
-    using Writer = void (*)(const TMAAResult *);
-    void (*SetResultWriter)(Writer) = nullptr;
+    using Fn1 = TMAAResult *(U32);
+    void (*SetResultWriter)(void (*)(const TMAAResult *)) = nullptr;
     void (*SetCmdString)(const U8 *) = nullptr;
     void (*SetCmdName)(const U8 *) = nullptr;
+    void (*SetMachineName)(const char *) = nullptr;
     U32 (*AddrMap)(void *, U32) = nullptr;
     TMAAResult *(*General)(U32, U32 *) = nullptr;
     TMAAResult *(*StrIFOpt2)(U32, U32) = nullptr;
-    TMAAResult *(*PBAStrIFOpt1)(U32) = nullptr;
-    TMAAResult *(*ImgStbStart)(U32) = nullptr;
-    TMAAResult *(*FTCATest)(U32) = nullptr;
+    TMAAResult *(*SetUIEnable)() = nullptr;
+    Fn1 *PBAStrIFOpt1 = nullptr, *ImgStbStart = nullptr, *FTCATest = nullptr, *CheckCPUTemperature = nullptr;
 
-    bool Load() {
-        SetResultWriter = hidden::Function<void(Writer)>("MAA_SetResultWriter(void (*)(TMAAResult const*))");
-        SetCmdString = hidden::Function<void(const U8 *)>("MAA_SetCmdString(unsigned char const*)");
-        SetCmdName = hidden::Function<void(const U8 *)>("MAA_SetCmdName(unsigned char const*)");
-        AddrMap = hidden::Function<U32(void *, U32)>("MAA_AddrMap(void*, unsigned int)");
-        General = hidden::Function<TMAAResult *(U32, U32 *)>("MAA_GENERAL_FUNCTION(unsigned int, unsigned int*)");
-        StrIFOpt2 = hidden::Function<TMAAResult *(U32, U32)>("Eng_MaaStrIFOpt2(unsigned int, unsigned int)");
-        PBAStrIFOpt1 = hidden::Function<TMAAResult *(U32)>("Eng_MaaPBAStrIFOpt1(unsigned int)");
-        ImgStbStart = hidden::Function<TMAAResult *(U32)>("Eng_MaaImgStbStart(unsigned int)");
-        FTCATest = hidden::Function<TMAAResult *(U32)>("Eng_MaaStrFTCATest(unsigned int)");
-        return SetResultWriter && SetCmdString && SetCmdName && AddrMap && General && StrIFOpt2 && PBAStrIFOpt1 &&
-               ImgStbStart && FTCATest;
+    void Load() {
+        using hidden::Function;
+        using Writer = void (*)(const TMAAResult *);
+        SetResultWriter = Function<void(Writer)>("MAA_SetResultWriter(void (*)(TMAAResult const*))");
+        SetCmdString = Function<void(const U8 *)>("MAA_SetCmdString(unsigned char const*)");
+        SetCmdName = Function<void(const U8 *)>("MAA_SetCmdName(unsigned char const*)");
+        SetMachineName = Function<void(const char *)>("MAA_SetMachineName(char const*)");
+        AddrMap = Function<U32(void *, U32)>("MAA_AddrMap(void*, unsigned int)");
+        General = Function<TMAAResult *(U32, U32 *)>("MAA_GENERAL_FUNCTION(unsigned int, unsigned int*)");
+        StrIFOpt2 = Function<TMAAResult *(U32, U32)>("Eng_MaaStrIFOpt2(unsigned int, unsigned int)");
+        SetUIEnable = Function<TMAAResult *()>("SetUIEnable()");
+        PBAStrIFOpt1 = Function<Fn1>("Eng_MaaPBAStrIFOpt1(unsigned int)");
+        ImgStbStart = Function<Fn1>("Eng_MaaImgStbStart(unsigned int)");
+        FTCATest = Function<Fn1>("Eng_MaaStrFTCATest(unsigned int)");
+        CheckCPUTemperature = Function<Fn1>("CheckCPUTemperature(unsigned int)");
     }
 };
 
-class MaaJavaCalls : public PrintJvmTest {
+// The reader waits on its queue with the daemon as globalPrintObj and leaves
+// the library to the test thread, which calls the functions as the shell would.
+class MaaJvm : public PrintJvmTest {
 protected:
-    // The reader waits on its queue and leaves the library to the test thread.
-    void Start(const char *daemonClass = fixtures::kRecordingDaemon) {
-        StartReader(daemonClass, false);
+    void SetUp() override {
+        PrintJvmTest::SetUp();
+        StartReader(Daemon(), false);
         if (HasFatalFailure()) return;
-        ASSERT_TRUE(sh.Load());
+        sh.Load();
+        ASSERT_FALSE(HasFailure());
         sh.SetResultWriter(&Capture);
+        sh.SetMachineName("x86_64");
     }
     void TearDown() override {
         if (sh.SetResultWriter) sh.SetResultWriter(nullptr);
         PrintJvmTest::TearDown();
     }
+    virtual const char *Daemon() const { return fixtures::kRecordingDaemon; }
+
     // The shell's state before a call: the command line and the called name.
     void Command(const std::string &line, const std::string &name) {
         command_ = line;
@@ -71,10 +84,19 @@ protected:
         std::string &kept = texts_.emplace_back(text);
         return sh.AddrMap(kept.data(), static_cast<U32>(kept.size() + 1));
     }
-    // Recs written at once, then the returned one; and no exception left.
-    Recs Seen(const TMAAResult *returned) {
+    // Records written at once, then the returned one; and no exception left.
+    static Recs Seen(const TMAAResult *returned) {
         EXPECT_FALSE(jvm::Env()->ExceptionCheck()) << "a Java exception was left pending";
         return maarec::Seen(returned);
+    }
+    // What the host receives from one call on its own.
+    template <typename Call>
+    static Recs HostSees(Call call) {
+        written.clear();
+        return Seen(call());
+    }
+    Recs Temperature(U32 mode) {
+        return HostSees([&] { return sh.CheckCPUTemperature(mode); });
     }
 
     Shell sh;
@@ -82,9 +104,56 @@ protected:
     std::list<std::string> texts_;
 };
 
-TEST_F(MaaJavaCalls, EngineCommandReachesItsJavaMethodAndTheReplyComesBackAsOneFinalRecord) {
-    Start();
-    if (HasFatalFailure()) return;
+class MaaJvmWithoutUpcalls : public MaaJvm {
+protected:
+    const char *Daemon() const override { return fixtures::kDaemonWithoutUpcalls; }
+};
+
+TEST_F(MaaJvm, CpuTemperatureStartAndEndCallTheirJavaMethodsAndReportTheReply) {
+    EXPECT_EQ(Temperature(0), (Recs{Cont("[ CPU_TEMP_START ]"), Cont("CPU_TEMP_START = OK"),
+                                    End("CPU temperature recording started")}));
+    fixtures::SetReply("maaCheckCPUTemperatureEnd", "max 61.5 C\nmin 40.0 C");
+    EXPECT_EQ(Temperature(1),
+              (Recs{Cont("[ CPU_TEMP_END ]"), Cont("CPU_TEMP_END = OK"), End("max 61.5 C\nmin 40.0 C")}));
+    const std::string reply(6000, 'r');
+    fixtures::SetReply("maaCheckCPUTemperatureStart", reply);
+    EXPECT_EQ(Temperature(0).back(), End(reply.substr(0, 4999)));  // cut to its buffer
+    EXPECT_EQ(Temperature(5), Recs{End("Failed")});  // refused: never reaches Java
+    EXPECT_EQ(fixtures::EventLines(), (std::vector<std::string>{"maaCheckCPUTemperatureStart",
+                                                                "maaCheckCPUTemperatureEnd",
+                                                                "maaCheckCPUTemperatureStart"}));
+}
+
+TEST_F(MaaJvm, CpuTemperatureJavaFailuresEndTheTestAndAreCleared) {
+    const Recs noReply{Cont("[ CPU_TEMP_END ]"), Cont("CPU_TEMP_END = OK"), End("Failed jcheckCPUTemperature NULL")};
+    fixtures::ReturnNull("maaCheckCPUTemperatureEnd");
+    EXPECT_EQ(Temperature(1), noReply);
+    fixtures::ReturnNull("maaCheckCPUTemperatureEnd", false);
+    fixtures::ThrowOn("maaCheckCPUTemperatureEnd", 1);
+    EXPECT_EQ(Temperature(1), noReply);
+    EXPECT_EQ(fixtures::EventLines(),
+              (std::vector<std::string>{"maaCheckCPUTemperatureEnd!null", "maaCheckCPUTemperatureEnd!throw"}));
+    // The test thread's one local frame lives as long as the thread: a leaked
+    // reference per call would exceed its capacity and -Xcheck:jni would say so.
+    for (int i = 0; i < 100; ++i) ASSERT_EQ(Temperature(i % 2).back().st, MAA_RESULT_END);
+    EXPECT_EQ(fixtures::Calls("maaCheckCPUTemperatureStart"), 50);
+}
+
+TEST_F(MaaJvm, PanelSetUIEnableTakesTheServiceReplyAsTheVerdictAndJavaFailuresEndInFailed) {
+    const auto call = [this] { return sh.SetUIEnable(); };
+    const Rec header = Cont("[ SetUIEnable ]");
+    EXPECT_EQ(HostSees(call), (Recs{header, End("SetUIEnable = OK")}));
+    fixtures::SetReply("maaSetUIEnable", "panel on");
+    EXPECT_EQ(HostSees(call), (Recs{header, End("panel on")}));
+    fixtures::ReturnNull("maaSetUIEnable");
+    EXPECT_EQ(HostSees(call), (Recs{header, End("Failed")}));
+    fixtures::ReturnNull("maaSetUIEnable", false);
+    fixtures::ThrowOn("maaSetUIEnable");
+    EXPECT_EQ(HostSees(call), (Recs{header, End("Failed")}));
+    EXPECT_EQ(fixtures::Calls("maaSetUIEnable"), 4);
+}
+
+TEST_F(MaaJvm, EngineCommandReachesItsJavaMethodAndTheReplyComesBackAsOneFinalRecord) {
     const std::string longReply(6000, 'r');
     struct Case {
         TMAAResult *(*call)(const Shell &);
@@ -110,76 +179,68 @@ TEST_F(MaaJavaCalls, EngineCommandReachesItsJavaMethodAndTheReplyComesBackAsOneF
     }
 }
 
-TEST_F(MaaJavaCalls, PbaReplyIsSentLineByLineAndEachLineLosesItsCarriageReturn) {
-    Start();
-    if (HasFatalFailure()) return;
+TEST_F(MaaJvm, PbaReplyIsSentLineByLineAndEachLineLosesItsCarriageReturn) {
     Command("FRA_Feed(1,2,3,4)", "FRA_Feed");
     fixtures::SetReply("maaEngMaaStrNormalTest", "Tray1=OK\r\nTray2=NG\r\n" + std::string(80, 'z') + "\r\nEND\r\n");
     EXPECT_EQ(Seen(sh.PBAStrIFOpt1(0)), (Recs{Cont("[ FRA_Feed ]"), Cont("Tray1=OK"), Cont("Tray2=NG"),
                                               Cont(std::string(63, 'z')), End("END")}));
 }
 
-TEST_F(MaaJavaCalls, HostBytesThatAreNoModifiedUtf8ReachJavaAsQuestionMarks) {
-    Start();
-    if (HasFatalFailure()) return;
+TEST_F(MaaJvm, HostBytesThatAreNoModifiedUtf8ReachJavaAsQuestionMarks) {
     Command("GetData(\"\xff\xc3\xa9\xc0\x80\")", "GetData");
     EXPECT_EQ(Seen(sh.StrIFOpt2(0, 0)).back().data, "NG: no engine");
     EXPECT_EQ(fixtures::EventLines(), std::vector<std::string>{"maaEngMaaStrNormalTest:GetData(\"?\xc3\xa9??\")"});
 }
 
-TEST_F(MaaJavaCalls, EngineFailuresEndWithTheirTextsAndLeaveNoException) {
-    Start();
-    if (HasFatalFailure()) return;
-    Command("GetData(1,2)", "GetData");
-    fixtures::ReturnNull("maaEngMaaStrNormalTest");
-    EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Recs{Cont("[ GetData ]"), End("GetData=NG")}));
-    EXPECT_EQ(LoggerHost_Count("Error in Eng_MaaStrNormalTest()::Return Data(GetData)\n"), 1);
-
-    Command("GetData(1,2)", "GetData");
-    fixtures::ThrowOn("maaEngMaaStrNormalTest");
-    EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Recs{Cont("[ GetData ]"), End("GetData=NG")}));
-    EXPECT_EQ(fixtures::Calls("maaEngMaaStrNormalTest"), 1);
-
-    Command("", "GetData");
-    sh.SetCmdString(nullptr);
-    EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Recs{Cont("[ GetData ]"), End("Failed")}));
-    EXPECT_EQ(LoggerHost_Count("Error in Eng_MaaStrNormalTest()::can't get MAA Command String\n"), 1);
-    EXPECT_EQ(fixtures::Calls("maaEngMaaStrNormalTest"), 0);
+TEST_F(MaaJvm, EngineFailuresEndWithTheirTextsAndLeaveNoException) {
+    struct Case {
+        void (*fail)();
+        bool command;  // a command string is set
+        const char *verdict, *logged;
+        int calls;
+    } cases[] = {
+        {[] { fixtures::ReturnNull("maaEngMaaStrNormalTest"); }, true, "GetData=NG",
+         "Error in Eng_MaaStrNormalTest()::Return Data(GetData)\n", 1},
+        {[] { fixtures::ThrowOn("maaEngMaaStrNormalTest"); }, true, "GetData=NG", nullptr, 1},
+        {[] {}, false, "Failed", "Error in Eng_MaaStrNormalTest()::can't get MAA Command String\n", 0},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.verdict);
+        Command("GetData(1,2)", "GetData");
+        if (!c.command) sh.SetCmdString(nullptr);
+        c.fail();
+        EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Recs{Cont("[ GetData ]"), End(c.verdict)}));
+        if (c.logged) { EXPECT_EQ(LoggerHost_Count(c.logged), 1); }
+        EXPECT_EQ(fixtures::Calls("maaEngMaaStrNormalTest"), c.calls);
+    }
 }
 
-TEST_F(MaaJavaCalls, DaemonWithoutTheEngineMethodsGetsFailed) {
-    Start(fixtures::kDaemonWithoutUpcalls);
-    if (HasFatalFailure()) return;
-    struct Case {
-        TMAAResult *(*call)(const Shell &);
-        const char *logged;
-    } cases[] = {
-        {[](const Shell &s) { return s.StrIFOpt2(1, 2); },
-         "Error in Eng_MaaStrNormalTest()::can't find Eng_MaaStrNormalTest()\n"},
-        {[](const Shell &s) { return s.PBAStrIFOpt1(1); },
-         "Error in Eng_MaaStrNormalTest()::can't find Eng_MaaStrNormalTest()\n"},
-        {[](const Shell &s) { return s.ImgStbStart(1); },
+TEST_F(MaaJvmWithoutUpcalls, EveryCallFailsCleanly) {
+    const std::string cannotFindNormal = "Error in Eng_MaaStrNormalTest()::can't find Eng_MaaStrNormalTest()\n";
+    const Recs failed{Cont("[ ImageStablization ]"), End("Failed")};
+    struct Case { TMAAResult *(*call)(const Shell &); Recs seen; std::string logged; } cases[] = {
+        {[](const Shell &s) { return s.StrIFOpt2(1, 2); }, failed, cannotFindNormal},
+        {[](const Shell &s) { return s.PBAStrIFOpt1(1); }, failed, cannotFindNormal},
+        {[](const Shell &s) { return s.ImgStbStart(1); }, failed,
          "Error in Eng_MaaImgStbStart()::can't find maaEngMaaImageStabilization().\n"},
-        {[](const Shell &s) { return s.FTCATest(1); },
+        {[](const Shell &s) { return s.FTCATest(1); }, failed,
          "Error in Eng_MaaStrFTCATest()::can't find maaEngMaaOpcodeFTCATest().\n"},
+        {[](const Shell &s) { return s.SetUIEnable(); }, {Cont("[ SetUIEnable ]"), End("Failed")},
+         "can't find maaSetUIEnable()"},
+        {[](const Shell &s) { return s.CheckCPUTemperature(0); },
+         {Cont("[ CPU_TEMP_START ]"), End("Failed midCheckCPUTemperature NULL")}, ""},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.logged);
         Command("ImageStablization(1)", "ImageStablization");
-        EXPECT_EQ(Seen(c.call(sh)), (Recs{Cont("[ ImageStablization ]"), End("Failed")}));
-        EXPECT_EQ(LoggerHost_Count(c.logged), 1);
+        EXPECT_EQ(Seen(c.call(sh)), c.seen);
+        EXPECT_TRUE(LoggerHost_Contains(c.logged));
     }
 }
 
-TEST_F(MaaJavaCalls, GeneralFunctionPassesIdAndArgumentTextsAndSendsTheReplyByItsPrefix) {
-    Start();
-    if (HasFatalFailure()) return;
+TEST_F(MaaJvm, GeneralFunctionPassesIdAndArgumentTextsAndSendsTheReplyByItsPrefix) {
     const std::string hundred(100, 'h');
-    struct Case {
-        std::vector<U32> args;
-        std::string reply, journaled;
-        Recs seen;
-    } cases[] = {
+    struct Case { std::vector<U32> args; std::string reply, journaled; Recs seen; } cases[] = {
         {{1000000, Map("text")}, "spider:ABC", "1000000,text", {End("ABC")}},
         {{0, 0xFFFF}, "idpt:L1\r\nL2\r\nL3", "0,65535", {Cont("L1"), Cont("L2"), End("L3")}},
         {{Map(hundred)}, "Volt=3.3\r\n", hundred.substr(0, 99), {End("Volt=3.3\r\n")}},  // no known prefix: whole
@@ -196,14 +257,9 @@ TEST_F(MaaJavaCalls, GeneralFunctionPassesIdAndArgumentTextsAndSendsTheReplyByIt
     }
 }
 
-TEST_F(MaaJavaCalls, GeneralFunctionRefusesBadArgumentsWithoutCallingJava) {
-    Start();
-    if (HasFatalFailure()) return;
+TEST_F(MaaJvm, GeneralFunctionRefusesBadArgumentsWithoutCallingJava) {
     const U32 tooLong = Map(std::string(101, 'h'));
-    struct Case {
-        const char *what;
-        std::vector<U32> args;
-    } cases[] = {
+    struct Case { const char *what; std::vector<U32> args; } cases[] = {
         {"1000001 is a text address, and none is mapped there", {1000001}},
         {"a text of 101 characters", {7, tooLong}},
         {"eleven arguments", std::vector<U32>(11, 1)},
@@ -218,9 +274,7 @@ TEST_F(MaaJavaCalls, GeneralFunctionRefusesBadArgumentsWithoutCallingJava) {
     }
 }
 
-TEST_F(MaaJavaCalls, GeneralFunctionWithoutAReplyLogsItAndEndsWithFailed) {
-    Start();
-    if (HasFatalFailure()) return;
+TEST_F(MaaJvm, GeneralFunctionWithoutAReplyLogsItAndEndsWithFailed) {
     U32 args[] = {5};
     Command("Unknown(5)", "Unknown");  // the service serves no such function: null
     EXPECT_EQ(Seen(sh.General(1, args)), (Recs{End("Failed")}));

@@ -4,6 +4,7 @@
 #pragma once
 
 #include <sys/socket.h>
+#include <unistd.h>
 
 #include <fstream>
 #include <optional>
@@ -63,6 +64,12 @@ inline std::string BE32(U32 v) {
 inline std::string Frame(U32 st, U32 res, const std::string &data, std::optional<U32> size = {}) {
     return BE32(st) + BE32(res) + BE32(size ? *size : static_cast<U32>(data.size())) + data;
 }
+// The device's acknowledgement of the start and stop commands.
+inline const std::string kAck("\x1bwMAA-OK", 8);
+// A special command line, host to device.
+inline std::string Special(U8 code, U32 size) {
+    return std::string("#$%") + static_cast<char>(code) + BE32(size) + "\r";
+}
 // A file-transfer frame, device to host.
 inline std::string Transfer(U8 op, U32 size) { return std::string("#$%") + static_cast<char>(op) + BE32(size) + BE32(size); }
 // Recognisable bytes.
@@ -76,12 +83,26 @@ inline std::string ReadFile(const std::string &path) {
     ss << std::ifstream(path, std::ios::binary).rdbuf();
     return ss.str();
 }
-// A packet socket keeps each of the device's writes apart: one string each.
-inline std::vector<std::string> Writes(int fd) {
-    std::vector<std::string> out;
-    std::string buf(1 << 16, '\0');
-    for (ssize_t n; (n = ::recv(fd, buf.data(), buf.size(), MSG_DONTWAIT)) >= 0;) out.push_back(buf.substr(0, n));
-    return out;
-}
+// The session's channel as a packet socket pair: the device writes on
+// `device`, and each of its writes is read back apart, one string each.
+struct PacketChannel {
+    int device = -1, host = -1;
+    PacketChannel() {
+        int sp[2];
+        if (::socketpair(AF_UNIX, SOCK_SEQPACKET, 0, sp) == 0) device = sp[0], host = sp[1];
+    }
+    ~PacketChannel() {
+        ::close(device);
+        ::close(host);
+    }
+    PacketChannel(const PacketChannel &) = delete;
+    PacketChannel &operator=(const PacketChannel &) = delete;
+    std::vector<std::string> Writes() const {
+        std::vector<std::string> out;
+        std::string buf(1 << 16, '\0');
+        for (ssize_t n; (n = ::recv(host, buf.data(), buf.size(), MSG_DONTWAIT)) >= 0;) out.push_back(buf.substr(0, n));
+        return out;
+    }
+};
 
 }  // namespace maarec

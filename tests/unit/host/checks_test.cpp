@@ -11,17 +11,11 @@ namespace maahost {
 namespace {
 
 TEST(CheckDownloadSize, RefusesWhatTheSizeFieldCannotHold) {
-    struct Row {
-        uint64_t size;
-        bool refused;
-    } rows[] = {
-        {0, false},
-        {1, false},
-        {0xFFFFFFFFull, false},
+    struct Row { uint64_t size; bool refused; } rows[] = {
+        {0, false}, {1, false}, {0xFFFFFFFFull, false},
         {0x100000000ull, true},  // 4 GiB would go out as 0
         {0x100000005ull, true},  // ... and this as 5
-        {5ull << 30, true},
-        {UINT64_MAX, true},
+        {5ull << 30, true}, {UINT64_MAX, true},
     };
     for (const Row &r : rows) {
         SCOPED_TRACE(r.size);
@@ -36,11 +30,7 @@ TEST(CheckDownloadSize, RefusesWhatTheSizeFieldCannotHold) {
 
 TEST(DropBlankLines, KeepsEveryLineTheAutoRunShouldReach) {
     using Lines = std::vector<std::string>;
-    struct Row {
-        const char *name;
-        Lines script;
-        Lines kept;
-    } rows[] = {
+    struct Row { const char *name; Lines script; Lines kept; } rows[] = {
         {"none blank", {"a=1", "probe(7)"}, {"a=1", "probe(7)"}},
         {"empty lines anywhere", {"", "a=1", "", "", "probe(7)", ""}, {"a=1", "probe(7)"}},
         {"spaces and tabs only", {" ", "\t \t", "a=1"}, {"a=1"}},
@@ -57,10 +47,7 @@ TEST(DropBlankLines, KeepsEveryLineTheAutoRunShouldReach) {
 }
 
 TEST(CallsFunction, OnlyANameFollowedByAParenthesisOutsideTextsGetsTheLongWait) {
-    struct Row {
-        const char *line;
-        bool calls;
-    } rows[] = {
+    struct Row { const char *line; bool calls; } rows[] = {
         {"MAA_SymbolDump()", true},
         {"x = Delay_ms (5)", true},
         {"*(char*)(0x01000000 + 36) = 0x74", false},  // casts and grouping

@@ -6,13 +6,7 @@
 namespace maatest {
 namespace {
 
-class AddressMap : public ShellTest {
-protected:
-    void TearDown() override {
-        MAA_AddrReset();
-        ShellTest::TearDown();
-    }
-};
+using AddressMap = ShellTest;
 
 TEST_F(AddressMap, RegionsGetDistinctBasesAboveOneMillion) {
     U8 a[10], b[100], c[1];

@@ -14,10 +14,7 @@ TEST_F(Memory, SendMessagePostsSixteenBytesOnTheShellQueueAndAFailureIsOnlyLogge
     ASSERT_GE(queue, 0);
     ulMAAMsgQueueID = queue;
     MAA_IF_SendMessage(7, 0x11, 0x22, 0x33);
-    struct {
-        long mtype;
-        U32 text[8];
-    } msg{};
+    struct { long mtype; U32 text[8]; } msg{};
     ssize_t n = msgrcv(queue, &msg, sizeof msg.text, 0, IPC_NOWAIT);
     msgctl(queue, IPC_RMID, nullptr);
     ulMAAMsgQueueID = -1;

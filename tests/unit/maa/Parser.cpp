@@ -20,31 +20,35 @@ protected:
     U32 a = 0, b = 0, y = 0;
 };
 
-TEST_F(Parser, EmptyLinesAndStatementsAreAcceptedAndEveryStatementOfALineRuns) {
-    for (const char *line : {"", "   \t ", ";;", ";"}) EXPECT_EQ(run(line), 0u) << line;
-    EXPECT_TRUE(values().empty());  // nothing was evaluated
-    EXPECT_EQ(run("a=1;b=2"), 0u);
-    EXPECT_EQ(std::make_pair(a, b), std::make_pair(1u, 2u));
-    EXPECT_EQ(run("a=3;;b=4;"), 0u);
-    EXPECT_EQ(std::make_pair(a, b), std::make_pair(3u, 4u));
+// Lines in order, with the parser's verdict and the cells afterwards: every
+// statement of an accepted line runs, statements reduced before a syntax error
+// have run, a lexical error ends the input early, a rejected line runs nothing more.
+TEST_F(Parser, StatementsOfALineRunUntilTheLineEndsOrIsRejected) {
+    struct Step { const char *line; U32 result, a, b; } steps[] = {
+        {"", 0, 0, 0}, {"   \t ", 0, 0, 0}, {";;", 0, 0, 0}, {";", 0, 0, 0},
+        {"a=1;b=2", 0, 1, 2}, {"a=3;;b=4;", 0, 3, 4},
+        {"y = 0x12345; a = (int)y", 0, 0x12345, 4},
+        {"b = (char)(short)(long)y + 1", 0, 0x12345, 0x12346},
+        {"(char*)1, (short *)2, (long*)3", 0, 0x12345, 0x12346},
+        {"a=1; b=(2 y", 1, 1, 0x12346},  // the statement in error never completed
+        {"a=3; b=4 y", 1, 3, 4},  // default reductions complete a statement before the stray token is seen
+        {"a = 5 \"abc", 0, 5, 4},  // an unterminated string is an early end of the line
+        {"a = 6 \"\\q\"", 1, 5, 4},  // an unknown escape rejects the line
+        {"b = 7; a = \"\\q\"", 1, 5, 7},
+    };
+    for (const Step &s : steps) {
+        EXPECT_EQ(run(s.line), s.result) << s.line;
+        EXPECT_EQ(std::make_pair(a, b), std::make_pair(s.a, s.b)) << s.line;
+        if (std::string(s.line).find_first_not_of(" \t;") == std::string::npos) { EXPECT_TRUE(values().empty()); }
+    }
+    EXPECT_EQ(run("(int*)0x1000"), 0u);
+    EXPECT_EQ(lastValue(), "ValueAdr = 4096 = 0x1000\n");
     EXPECT_EQ(run("f()"), 0u);
     EXPECT_EQ(run("f2(1,2)"), 0u);
     ASSERT_EQ(calls.size(), 2u);
     EXPECT_EQ(calls[0].function, "f0");
     EXPECT_EQ(calls[1].words, (std::vector<U32>{1, 2}));
 }
-
-TEST_F(Parser, CastsAndPointerCastsParse) {
-    y = 0x12345;
-    EXPECT_EQ(run("a = (int)y"), 0u);
-    EXPECT_EQ(a, 0x12345u);
-    EXPECT_EQ(run("b = (char)(short)(long)y + 1"), 0u);
-    EXPECT_EQ(b, 0x12346u);
-    EXPECT_EQ(run("(int*)0x1000"), 0u);
-    EXPECT_EQ(lastValue(), "ValueAdr = 4096 = 0x1000\n");
-    EXPECT_EQ(run("(char*)1, (short *)2, (long*)3"), 0u);
-}
-
 TEST_F(Parser, LinesOutsideTheGrammarAreRejected) {
     const char *bad[] = {"a ? b : y = 5", "(unsigned)y", "a b", "a = ", "(a", "a)", "f(1,)", "(int)", "1 2",
                          "a ; b c", "||", "a ? b"};
@@ -54,28 +58,6 @@ TEST_F(Parser, LinesOutsideTheGrammarAreRejected) {
         EXPECT_TRUE(LoggerHost_Contains("syntax error")) << line;
     }
     EXPECT_EQ(y, 0u);
-}
-
-TEST_F(Parser, StatementsReducedBeforeASyntaxErrorHaveRun) {
-    EXPECT_EQ(run("a=1; b=(2 y"), 1u);
-    EXPECT_EQ(a, 1u);
-    EXPECT_EQ(b, 0u);  // the statement in error never completed
-    // Default reductions complete a statement before the stray token is seen.
-    EXPECT_EQ(run("a=3; b=4 y"), 1u);
-    EXPECT_EQ(a, 3u);
-    EXPECT_EQ(b, 4u);
-}
-
-TEST_F(Parser, ALexicalErrorEndsTheInputButARejectedLineRunsNothingMore) {
-    // An unterminated string is an early end of the line: what came before runs.
-    EXPECT_EQ(run("a = 5 \"abc"), 0u);
-    EXPECT_EQ(a, 5u);
-    // An unknown escape rejects the line: the statement in progress does not run.
-    EXPECT_EQ(run("a = 6 \"\\q\""), 1u);
-    EXPECT_EQ(a, 5u);
-    EXPECT_EQ(run("b = 7; a = \"\\q\""), 1u);
-    EXPECT_EQ(b, 7u);
-    EXPECT_EQ(a, 5u);
 }
 
 TEST_F(Parser, NestingDeeperThanTheStackIsRejected) {

@@ -80,6 +80,8 @@ protected:
         LoggerHost_StartCapture();
     }
     void TearDown() override {
+        MAA_FreeParamString();
+        MAA_AddrReset();
         MAA_SymbolClear();
         MAA_SetResultWriter(nullptr);
         LoggerHost_StopCapture();

@@ -3,20 +3,13 @@
 // files they read under a private root.
 #include <filesystem>
 
-#include "maa/functions/MAA_CpuTemp.h"
 #include "maa_functions/FnFixture.h"
 #include "print/USBPrint.h"
 
 namespace fntest {
 namespace {
 
-class CpuTemp : public FnTest {
-protected:
-    void TearDown() override {
-        MAA_SetMachineName(nullptr);
-        FnTest::TearDown();
-    }
-};
+using CpuTemp = FnTest;
 
 TEST_F(CpuTemp, FanTestsRunTheirCommandsAndReadTheStatusFiles) {
     const std::string fanTest = root / "/proc/cpufantest", fanStatus = root / "/proc/fanstatus";
@@ -25,6 +18,7 @@ TEST_F(CpuTemp, FanTestsRunTheirCommandsAndReadTheStatusFiles) {
     const std::string start = "echo start > " + fanTest, stop = "echo stop > " + fanTest;
     const std::string script = root / "/etc/halvard/config/system/cpu_temp.sh &", kill = "killall cpu_temp.sh";
     const Rec head = Cont("[CPU FAN Temp Test]");
+    const std::vector<std::string> ended = {kill, "rm -rf " + data};
     struct Case {
         U32 mode;
         std::string file;
@@ -42,13 +36,12 @@ TEST_F(CpuTemp, FanTestsRunTheirCommandsAndReadTheStatusFiles) {
         {0, fanStatus, "FALSE\n", {head, End("CPU Fan  = FALSE")}, {}},
         {0, fanStatus, nullptr, {head, Cont("fail to open /proc/fanstatus"), End("CPU Fan  = FALSE")}, {}},
         // Its end sends the data line by line.
-        {1, data, "45.0\n46.5\n47.0\n",
-         {head, Cont("45.0"), Cont("46.5"), Cont("47.0"), End("CPU_TEMP_END = OK")}, {kill, "rm -rf " + data}},
-        {1, data, "45.0\n46.5\n47.0", {head, Cont("45.0"), Cont("46.5"), End("CPU_TEMP_END = OK")}, {kill, "rm -rf " + data}},
-        {1, data, "1\n\n2\n", {head, Cont("1"), Cont(""), Cont("2"), End("CPU_TEMP_END = OK")}, {kill, "rm -rf " + data}},
-        {1, data, "", {head, End("CPU_TEMP_END = OK")}, {kill, "rm -rf " + data}},
-        {1, data, longFile.c_str(), {head, Cont(longLine.substr(0, 1023)), End("CPU_TEMP_END = OK")},
-         {kill, "rm -rf " + data}},
+        {1, data, "45.0\n46.5\n47.0\n", {head, Cont("45.0"), Cont("46.5"), Cont("47.0"), End("CPU_TEMP_END = OK")},
+         ended},
+        {1, data, "45.0\n46.5\n47.0", {head, Cont("45.0"), Cont("46.5"), End("CPU_TEMP_END = OK")}, ended},
+        {1, data, "1\n\n2\n", {head, Cont("1"), Cont(""), Cont("2"), End("CPU_TEMP_END = OK")}, ended},
+        {1, data, "", {head, End("CPU_TEMP_END = OK")}, ended},
+        {1, data, longFile.c_str(), {head, Cont(longLine.substr(0, 1023)), End("CPU_TEMP_END = OK")}, ended},
         {1, data, nullptr, {head, End("Error Opening cpu_temp_data.txt File")}, {kill}},
         {4, data, nullptr, {head, End("Argument 1 is wrong option.")}, {}},
         {0xFFFFFFFF, data, nullptr, {head, End("Argument 1 is wrong option.")}, {}},

@@ -15,10 +15,7 @@ namespace {
 using FaxJbig = FnTest;
 
 TEST_F(FaxJbig, EachFaxNameSendsItsLineAndWritesHeaderAndResponse) {
-    struct Case {
-        const char *shell, *name, *line;
-        bool scannerLock;
-    } cases[] = {
+    struct Case { const char *shell, *name, *line; bool scannerLock; } cases[] = {
         {"SPI_Set_Speaker_Test(2)", "SetSpeakerTest", "SetSpeakerTest(2)", false},
         {"SysPBA_IO_Fax_GPITest(1,2,3)", "SysPBA_IO_Fax_GPITest", "SysPBA_IO_Fax_GPITest(1,2,3)", true},
         {"SysPBA_IO_Fax_GPOTest(1,0,0xFFFFFFFF,4)", "SysPBA_IO_Fax_GPOTest", "SysPBA_IO_Fax_GPOTest(1,0,4294967295,4)",
@@ -46,12 +43,7 @@ TEST_F(FaxJbig, EachFaxNameSendsItsLineAndWritesHeaderAndResponse) {
 }
 
 TEST_F(FaxJbig, WithoutAResponseTextTheVerdictFollowsTheDriversSuccess) {
-    struct Case {
-        std::string response;
-        std::optional<uint32_t> result;
-        uint32_t success;
-        Rec last;
-    } cases[] = {
+    struct Case { std::string response; std::optional<uint32_t> result; uint32_t success; Rec last; } cases[] = {
         {"", std::nullopt, 1, End("PhoneTest_Ring DONE", 1)},
         {"", std::nullopt, 0, End("PhoneTest_Ring FAIL", 0)},
         {"NO DIAL TONE", std::nullopt, 0, End("NO DIAL TONE", 0)},
@@ -76,16 +68,12 @@ TEST_F(FaxJbig, WithoutAResponseTextTheVerdictFollowsTheDriversSuccess) {
 }
 
 TEST_F(FaxJbig, FailedStepsAreNamedAndTheLockIsNeverLeftHeld) {
-    struct Case {
-        std::function<void()> script;
-        std::string text;
-        size_t lockAttempts, releases, faxCalls;
-    } cases[] = {
+    struct Case { std::function<void()> script; std::string text; size_t lockAttempts, releases, faxCalls; } cases[] = {
         {[] { vdev::SetPresent(vdev::kScanner, false); }, "critical error! failed to open scan device", 0, 0, 0},
         {[] { vdev::SetScanLockDefault(0); }, "scanner is busy or in sleep", 31, 0, 0},
         {[] { vdev::SetPresent(vdev::kFax, false); }, "critical error! failed to open fax device", 1, 1, 0},
-        {[] { vdev::SetFaxTestAnswer({"x", std::nullopt, 1, 4}); }, "critical error! failed to control fax device", 1, 1,
-         1},
+        {[] { vdev::SetFaxTestAnswer({"x", std::nullopt, 1, 4}); }, "critical error! failed to control fax device",
+         1, 1, 1},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.text);
@@ -103,11 +91,7 @@ TEST_F(FaxJbig, FailedStepsAreNamedAndTheLockIsNeverLeftHeld) {
 }
 
 TEST_F(FaxJbig, HWJBIGTestChecksEncoderThenDecoder) {
-    struct Case {
-        std::function<void()> script;
-        std::string verdict;
-        int decoderResets;
-    } cases[] = {
+    struct Case { std::function<void()> script; std::string verdict; int decoderResets; } cases[] = {
         {[] {}, "HWJBIG TEST DONE", 1},
         {[] { vdev::SetJbigSelfTestStatus(vdev::kJbigDec, 9); }, "JBIG Decoder = NG", 1},
         {[] { vdev::SetJbigSelfTestStatus(vdev::kJbigEnc, 1); }, "JBIG Encoder = NG", 0},

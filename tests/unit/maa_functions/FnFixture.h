@@ -9,6 +9,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <list>
 #include <string>
 #include <vector>
 
@@ -20,6 +21,8 @@
 #include "maa/MAA_Parser.h"
 #include "maa/MAA_Symbol.h"
 #include "maa/MAA_Result.h"
+#include "maa/functions/MAA_CpuTemp.h"
+#include "maa/functions/MAA_Panel.h"
 #include "maa/functions/MAA_SysResult.h"
 #include "support/MaaRecords.h"
 #include "support/TempRoot.h"
@@ -49,6 +52,7 @@ protected:
         MAA_SetResultWriter(&Capture);
         MAA_SetCommandRunner(&RecordCommand);
         MAA_SetSleeper(&RecordSleep);
+        MAA_PanelSetWaits(50, 50, 50);  // no UI server answers unless a test starts one
         LoggerHost_StartCapture();
         Restart();
         ASSERT_GT(channel, 0);
@@ -61,6 +65,8 @@ protected:
         MAA_SetCommandRunner(nullptr);
         MAA_SetSleeper(nullptr);
         MAA_SetCmdString(nullptr);
+        MAA_SetMachineName(nullptr);
+        MAA_PanelSetWaits(0, 0, 0);
         MAA_SymbolClear();
         LoggerHost_StopCapture();
     }
@@ -82,6 +88,11 @@ protected:
         MAA_InputSet(reinterpret_cast<const U8 *>(kept.c_str()));
         return MAA_Parser();
     }
+    // The address of a copy of `text` in the shell's map, NUL included.
+    U32 Map(const std::string &text) {
+        std::string &kept = texts_.emplace_back(text);
+        return MAA_AddrMap(kept.data(), static_cast<U32>(kept.size() + 1));
+    }
     // Bytes the device sent on the session's channel other than by the writer.
     static std::string Wire() {
         std::vector<uint8_t> b = vdev::HostRead(vdev::kPrn);
@@ -90,6 +101,7 @@ protected:
 
     TempRoot root;
     int channel = -1;
+    std::list<std::string> texts_;  // stable addresses for the map
 };
 
 }  // namespace fntest

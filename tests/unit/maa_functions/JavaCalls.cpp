@@ -2,7 +2,6 @@
 // argument texts, reply forms and line splitting as the host sees them, and a
 // clean end when there is no JVM behind them.
 #include <cstring>
-#include <list>
 
 #include "maa/functions/MAA_EngineIF.h"
 #include "maa/functions/MAA_General.h"
@@ -11,15 +10,7 @@
 namespace fntest {
 namespace {
 
-class JavaCalls : public FnTest {
-protected:
-    // The address of a copy of `text` in the shell's map, NUL included.
-    U32 Map(const std::string &text) {
-        std::string &kept = texts_.emplace_back(text);
-        return MAA_AddrMap(kept.data(), static_cast<U32>(kept.size() + 1));
-    }
-    std::list<std::string> texts_;  // stable addresses for the map
-};
+using JavaCalls = FnTest;
 
 TEST_F(JavaCalls, RepliesAreSplitIntoLinesOrSentWholeByTheirPrefix) {
     const std::string x100(100, 'x'), w200(200, 'w');
@@ -56,11 +47,7 @@ TEST_F(JavaCalls, RepliesAreSplitIntoLinesOrSentWholeByTheirPrefix) {
 TEST_F(JavaCalls, ArgumentWordsBecomeNumbersOrTheTextsTheyAddress) {
     const std::string hundred(100, 'h');
     char unterminated[4] = {'a', 'b', 'c', 'd'};
-    struct Case {
-        U32 word;
-        bool ok;
-        std::string text;
-    } cases[] = {
+    struct Case { U32 word; bool ok; std::string text; } cases[] = {
         {0, true, "0"},
         {1000000, true, "1000000"},
         {1000001, false, ""},  // a text address, and no region holds it
@@ -101,10 +88,7 @@ TEST_F(JavaCalls, WithoutAJvmTheGeneralFunctionSendsNothingAndForwardedCallsGetN
 TEST_F(JavaCalls, WithoutAJvmEveryEngineFunctionSendsItsBoundedHeaderThenFailed) {
     using Fn = TMAAResult *(*)();
     const std::string normal = "Error in Eng_MaaStrNormalTest()::can't find class PrintDaemon\n";
-    struct Case {
-        Fn call;
-        std::string logged;
-    } cases[] = {
+    struct Case { Fn call; std::string logged; } cases[] = {
         {[] { return Eng_MaaStrIFOpt0(); }, normal},
         {[] { return Eng_MaaStrIFOpt5(1, 2, 3, 4, 5); }, normal},
         {[] { return Eng_MaaStrIFOpt1_Str(0); }, normal},

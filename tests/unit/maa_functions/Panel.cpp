@@ -4,10 +4,8 @@
 #include <chrono>
 #include <cstdlib>
 #include <filesystem>
-#include <functional>
 
 #include "UiPeer.h"
-#include "maa/functions/MAA_Panel.h"
 #include "maa_functions/FnFixture.h"
 
 namespace fntest {
@@ -25,74 +23,68 @@ protected:
     }
     void TearDown() override {
         ::unsetenv("USBADAPTER_UI_PORT");
-        MAA_PanelSetWaits(0, 0, 0);
         FnTest::TearDown();
     }
 
     void writeAddress(const std::string &text) { std::ofstream(root / kAddressFile, std::ios::binary) << text; }
     static void usePort(uint16_t port) { ::setenv("USBADAPTER_UI_PORT", std::to_string(port).c_str(), 1); }
 
-    // What the host receives from one call: the records written at once, then
-    // the returned one.
-    static Recs hostSees(const std::function<TMAAResult *()> &call) {
+    // What the host receives from one command line.
+    static Recs HostSees(const char *line) {
         written.clear();
-        TMAAResult *r = call();
-        EXPECT_EQ(r, &stMAASysResult);
-        return Seen(r);
+        EXPECT_EQ(Run(line), 0u) << line;
+        return written;
     }
 };
 
-using Call = std::function<TMAAResult *()>;
-
+// Each registered name, called through the shell, which writes the returned record.
 TEST_F(Panel, ClientTestsSendTheirRequestAndMapTheAnswer) {
     using Answers = std::vector<std::pair<std::string, std::string>>;  // answer, final record
-    struct Case {
-        Call call;
-        std::string request, header;
-        Answers answers;
-    } cases[] = {
-        {[] { return UISSM_IF_KeyInTest_And_Cli(5); }, std::string("1\x05", 2), "[ UISSM_IF_KeyInTest : Argument=5 ]",
+    struct Case { const char *line; std::string request, header; Answers answers; } cases[] = {
+        {"UISSM_MAA_KeyInTest(5)", std::string("1\x05", 2), "[ UISSM_IF_KeyInTest : Argument=5 ]",
          {{"9", "KEY TEST DONE"}, {"x9", "KEY TEST FAIL"}}},
-        {[] { return UISSM_IF_LED_Test_And_Cli(1); }, "2\x01", "[ UISSM_IF_LED_Test : Argument=1 ]",
+        {"UISSM_MAA_LED_Test(1)", "2\x01", "[ UISSM_IF_LED_Test : Argument=1 ]",
          {{"9", "LED TEST DONE"}, {"1", "LED TEST FAIL"}}},
-        {UISSM_IF_Key_WaitTest_And_Cli, "3", "[ UISSM_IF_Key_WaitTest ]", {{"9", "WAIT TEST DONE"}, {"3", "WAIT TEST FAIL"}}},
-        {UISSM_IF_Key_LCD_Test_And_Cli, "4", "[ UISSM_IF_Key_LCD_Test ]", {{"9", "LCD TEST DONE"}, {"0", "LCD TEST FAIL"}}},
-        {UISSM_MAA_CountrySkip_And_Cli, "5", "[ UISSM_MAA_CountrySkip ]",
+        {"UISSM_MAA_Key_WaitTest()", "3", "[ UISSM_IF_Key_WaitTest ]",
+         {{"9", "WAIT TEST DONE"}, {"3", "WAIT TEST FAIL"}}},
+        {"UISSM_MAA_Key_LCD_Test()", "4", "[ UISSM_IF_Key_LCD_Test ]",
+         {{"9", "LCD TEST DONE"}, {"0", "LCD TEST FAIL"}}},
+        {"UISSM_MAA_CountrySkip()", "5", "[ UISSM_MAA_CountrySkip ]",
          {{"9", "COUNTRY SKIP DONE"}, {"x", "COUNTRY SKIP FAIL"}}},
-        {UISSM_MAA_TrayConfirmSkip_And_Cli, "6", "[ UISSM_MAA_TrayConfirmSkip ]",
+        {"UISSM_MAA_TrayConfirmSkip()", "6", "[ UISSM_MAA_TrayConfirmSkip ]",
          {{"9", "TRAY CONFIRM SKIP DONE"}, {"x", "TRAY CONFIRM SKIP FAIL"}}},
-        {[] { return SPI_Set_UI_Power_Save_And_Cli(1); }, "7", "[ SPI_Set_UI_Power_Save : Argument=1 ]",
+        {"SPI_Set_UI_Power_Save(1)", "7", "[ SPI_Set_UI_Power_Save : Argument=1 ]",
          {{"9", "SPI_Set_UI_Power_Save DONE"}}},
-        {[] { return SPI_Set_UI_Power_Save_And_Cli(0); }, "8", "[ SPI_Set_UI_Power_Save : Argument=0 ]",
+        {"SPI_Set_UI_Power_Save(0)", "8", "[ SPI_Set_UI_Power_Save : Argument=0 ]",
          {{"x", "SPI_Set_UI_Power_Save FAIL"}}},
-        {[] { return SPI_Set_UI_Power_Save_And_Cli(2); }, std::string(1, '\0'), "[ SPI_Set_UI_Power_Save : Argument=2 ]",
+        {"SPI_Set_UI_Power_Save(2)", std::string(1, '\0'), "[ SPI_Set_UI_Power_Save : Argument=2 ]",
          {{"9", "SPI_Set_UI_Power_Save DONE"}}},  // any other: one zero byte
-        {[] { return UISSM_MAA_TSPCalibration_Result_And_Cli(0); }, "0", "[ UISSM_MAA_TSPCalibration_Result : Argument=0 ]",
+        {"UISSM_MAA_TSPCalibration_Result(0)", "0", "[ UISSM_MAA_TSPCalibration_Result : Argument=0 ]",
          {{"9", "UISSM_MAA_TSPCalibration_Result DONE"}, {"1", "Result= OK"}, {"2", "Result= NG"}}},
-        {[] { return UISSM_MAA_TSPCalibration_Result_And_Cli(7); }, std::string(1, '\0'),
-         "[ UISSM_MAA_TSPCalibration_Result : Argument=7 ]", {{"3", "UISSM_MAA_TSPCalibration_Result FAIL"}}},
-        {PbaMode_UI_Data_clear, "9", "[ PbaMode_UI_Data_clear ]", {{"9", "UI Clear = OK"}, {"8", "UI Clear = NG"}}},
-        {SPI_Get_UI, "A", "[ SPI_Get_UI ]",
+        {"UISSM_MAA_TSPCalibration_Result(7)", std::string(1, '\0'), "[ UISSM_MAA_TSPCalibration_Result : Argument=7 ]",
+         {{"3", "UISSM_MAA_TSPCalibration_Result FAIL"}}},
+        {"PbaMode_UI_Data_clear()", "9", "[ PbaMode_UI_Data_clear ]", {{"9", "UI Clear = OK"}, {"8", "UI Clear = NG"}}},
+        {"SPI_Get_UI()", "A", "[ SPI_Get_UI ]",
          {{"1", "SPI_Get_UI = OLD"}, {"2", "SPI_Get_UI = NEW"}, {"9", "SPI_Get_UI = FAIL"}}},  // 9 is no success here
-        {SPI_Set_UI_Reboot, "B", "[ SPI_Set_UI_Reboot ]", {{"9", "UI Reboot = OK"}, {"x", "UI Reboot = FAIL"}}},
-        {[] { return UISSM_MAA_Set_KeySound_And_Cli(0); }, std::string("C\0", 2), "[ UISSM_MAA_Set_KeySound : Argument = 0 ]",
+        {"SPI_Set_UI_Reboot()", "B", "[ SPI_Set_UI_Reboot ]", {{"9", "UI Reboot = OK"}, {"x", "UI Reboot = FAIL"}}},
+        {"UISSM_MAA_Set_KeySound(0)", std::string("C\0", 2), "[ UISSM_MAA_Set_KeySound : Argument = 0 ]",
          {{"9", "Key Sound On = OK"}, {"1", "Key Sound On = NG"}}},  // 0 is on
-        {[] { return UISSM_MAA_Set_KeySound_And_Cli(1); }, "C\x01", "[ UISSM_MAA_Set_KeySound : Argument = 1 ]",
+        {"UISSM_MAA_Set_KeySound(1)", "C\x01", "[ UISSM_MAA_Set_KeySound : Argument = 1 ]",
          {{"9", "Key Sound Off = OK"}, {"0", "Key Sound Off = NG"}}},
-        {UISSM_MAA_MIC_Test_And_Cli, "D", "[ UISSM_MAA_MIC_Test ]", {{"9", "MIC TEST DONE"}, {"x", "MIC TEST FAIL"}}},
-        {[] { return UISSM_MAA_HAPTIC_And_Cli(0x1FF); }, "E\xFF", "[ UISSM_MAA_HAPTIC : Argument=511 ]",
+        {"UISSM_MAA_MIC_Test()", "D", "[ UISSM_MAA_MIC_Test ]", {{"9", "MIC TEST DONE"}, {"x", "MIC TEST FAIL"}}},
+        {"UISSM_MAA_HAPTIC(0x1FF)", "E\xFF", "[ UISSM_MAA_HAPTIC : Argument=511 ]",
          {{"9", "HAPTIC TEST DONE"}, {"x", "HAPTIC TEST FAIL"}}},  // the argument's low byte
-        {[] { return UISSM_MAA_SpeakerTest_And_Cli(0xFFFFFFFFu); }, "F\xFF", "[ SPI_Set_Speaker_Test : Argument=-1 ]",
+        {"UISSM_MAA_Speaker(0xFFFFFFFF)", "F\xFF", "[ SPI_Set_Speaker_Test : Argument=-1 ]",
          {{"9", "[SPI_Set_Speaker_Test] DONE"}, {"x", "[SPI_Set_Speaker_Test] FAIL"}}},  // the fax speaker test's name
-        {UISSM_MAA_USB_Test_And_Cli, "G", "[ UISSM_MAA_USB_Test ]", {{"9", "OK"}, {"x", "NG"}}},
+        {"UISSM_MAA_USB_Test()", "G", "[ UISSM_MAA_USB_Test ]", {{"9", "OK"}, {"x", "NG"}}},
     };
     for (const Case &c : cases) {
         for (const auto &[answer, final] : c.answers) {
-            SCOPED_TRACE(c.header + " answered " + answer);
+            SCOPED_TRACE(std::string(c.line) + " answered " + answer);
             uipeer::Server server(uipeer::AnswerAll(answer));
             ASSERT_TRUE(server.ok());
             usePort(server.port());
-            EXPECT_EQ(hostSees(c.call), (Recs{Cont(c.header), End(final)}));
+            EXPECT_EQ(HostSees(c.line), (Recs{Cont(c.header), End(final)}));
             ASSERT_TRUE(server.awaitServed(1, 2000));
             EXPECT_EQ(server.requests(), std::vector<std::string>{c.request});
         }
@@ -101,30 +93,25 @@ TEST_F(Panel, ClientTestsSendTheirRequestAndMapTheAnswer) {
 
 TEST_F(Panel, WithoutAnAnswerTheHeaderIsTheLastRecord) {
     struct Case {
-        const char *name;
-        Call call;
+        const char *line;
         std::string answer;  // what the server sends back ("": nothing)
         bool hold;           // keeps the connection open without answering
         std::string header;
-    };
-    const std::vector<Case> cases = {
-        {"closed at once", UISSM_IF_Key_WaitTest_And_Cli, "", false, "[ UISSM_IF_Key_WaitTest ]"},
-        {"closed at once, key sound", [] { return UISSM_MAA_Set_KeySound_And_Cli(0); }, "", false,
-         "[ UISSM_MAA_Set_KeySound : Argument = 0 ]"},
+    } cases[] = {
+        {"UISSM_MAA_Key_WaitTest()", "", false, "[ UISSM_IF_Key_WaitTest ]"},  // closed at once
+        {"UISSM_MAA_Set_KeySound(0)", "", false, "[ UISSM_MAA_Set_KeySound : Argument = 0 ]"},
         // Neither on nor off: answers are read past until the server closes.
-        {"key sound 2 answered", [] { return UISSM_MAA_Set_KeySound_And_Cli(2); }, "9", false,
-         "[ UISSM_MAA_Set_KeySound : Argument = 2 ]"},
-        // No answer within the answer wait.
-        {"silent server", SPI_Get_UI, "", true, "[ SPI_Get_UI ]"},
+        {"UISSM_MAA_Set_KeySound(2)", "9", false, "[ UISSM_MAA_Set_KeySound : Argument = 2 ]"},
+        {"SPI_Get_UI()", "", true, "[ SPI_Get_UI ]"},  // no answer within the answer wait
     };
     MAA_PanelSetWaits(2000, 2000, 100);
     for (const Case &c : cases) {
-        SCOPED_TRACE(c.name);
+        SCOPED_TRACE(c.line);
         uipeer::Server server(uipeer::Scripted({uipeer::Step{c.answer, c.hold}}));
         ASSERT_TRUE(server.ok());
         usePort(server.port());
         const auto start = std::chrono::steady_clock::now();
-        EXPECT_EQ(hostSees(c.call), (Recs{Cont(c.header), Cont(c.header)}));
+        EXPECT_EQ(HostSees(c.line), (Recs{Cont(c.header), Cont(c.header)}));
         EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));  // not the operator's minutes
         EXPECT_EQ(server.requests().size(), 1u);
     }
@@ -153,7 +140,7 @@ TEST_F(Panel, TheAddressComesFromItsFileElseTheDefault) {
         std::filesystem::remove(root / kAddressFile);
         if (c.file) writeAddress(c.file);
         LoggerHost_StartCapture();
-        const auto records = hostSees(UISSM_MAA_USB_Test_And_Cli);
+        const auto records = HostSees("UISSM_MAA_USB_Test()");
         LoggerHost_StopCapture();
         if (c.reached) {
             EXPECT_EQ(records.back(), End("OK"));
@@ -168,47 +155,42 @@ TEST_F(Panel, TheAddressComesFromItsFileElseTheDefault) {
 
 TEST_F(Panel, ListeningTestsAcceptOnlyAnAnswerBeginningWithTheirCommand) {
     struct Case {
-        const char *name;
-        Call call;
+        const char *line;
         std::vector<std::string> answers;
         Recs records;
         std::string peerReceived;  // the command, then '3' padded to the answer's length
     } cases[] = {
-        {"key test", UISSM_IF_KeyInTest, {"2", "x", "1ab"},
-         {Cont("[ UISSM_IF_KeyInTest ]"), End("KEY TEST DONE")}, std::string("13\0\0", 4)},
-        {"led test", UISSM_IF_LED_Test, {"2"}, {Cont("[ UISSM_IF_LED_Test ]"), End("LED TEST DONE")}, "23"},
-        {"closed without answer", UISSM_IF_KeyInTest, {},
-         {Cont("[ UISSM_IF_KeyInTest ]"), Cont("[ UISSM_IF_KeyInTest ]")}, "1"},
+        {"UISSM_MAA_KeyInTest_pelmar()", {"2", "x", "1ab"}, {Cont("[ UISSM_IF_KeyInTest ]"), End("KEY TEST DONE")},
+         std::string("13\0\0", 4)},
+        {"UISSM_MAA_LED_Test_pelmar()", {"2"}, {Cont("[ UISSM_IF_LED_Test ]"), End("LED TEST DONE")}, "23"},
+        {"UISSM_MAA_KeyInTest_pelmar()", {}, {Cont("[ UISSM_IF_KeyInTest ]"), Cont("[ UISSM_IF_KeyInTest ]")}, "1"},
     };
     for (const Case &c : cases) {
-        SCOPED_TRACE(c.name);
+        SCOPED_TRACE(c.line);
         const uint16_t port = uipeer::FreePort();
         ASSERT_NE(port, 0);
         usePort(port);
         uipeer::Client peer(c.answers, port);
-        EXPECT_EQ(hostSees(c.call), c.records);
+        EXPECT_EQ(HostSees(c.line), c.records);
         peer.join();
         EXPECT_TRUE(peer.connected());
         EXPECT_EQ(peer.received(), c.peerReceived);
     }
 }
 
-TEST_F(Panel, ListeningTestsNameTheStepThatFailed) {
+TEST_F(Panel, ListeningTestsNameTheStepThatFailedAndSetUIEnableNeedsThePrintService) {
     // Nobody connects in time.
     MAA_PanelSetWaits(2000, 50, 2000);
     usePort(uipeer::FreePort());
-    EXPECT_EQ(hostSees(UISSM_IF_LED_Test), (Recs{Cont("[ UISSM_IF_LED_Test ]"),
-                                                                End("Accept from UIServer Fails")}));
+    EXPECT_EQ(HostSees("UISSM_MAA_LED_Test_pelmar()"),
+              (Recs{Cont("[ UISSM_IF_LED_Test ]"), End("Accept from UIServer Fails")}));
     // The port is taken by a listener.
     uipeer::Server other(uipeer::AnswerAll("9"));
     ASSERT_TRUE(other.ok());
     usePort(other.port());
-    EXPECT_EQ(hostSees(UISSM_IF_KeyInTest), (Recs{Cont("[ UISSM_IF_KeyInTest ]"),
-                                                                 End("Bind To UIServer Fails")}));
-}
-
-TEST_F(Panel, SetUIEnableWithoutThePrintServiceFails) {
-    EXPECT_EQ(hostSees(SetUIEnable), (Recs{Cont("[ SetUIEnable ]"), End("Failed")}));
+    EXPECT_EQ(HostSees("UISSM_MAA_KeyInTest_pelmar()"),
+              (Recs{Cont("[ UISSM_IF_KeyInTest ]"), End("Bind To UIServer Fails")}));
+    EXPECT_EQ(HostSees("SetUIEnable()"), (Recs{Cont("[ SetUIEnable ]"), End("Failed")}));
 }
 
 }  // namespace

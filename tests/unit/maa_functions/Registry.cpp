@@ -76,11 +76,7 @@ ScanToInspectionDust 0 4 s = | SFRReadWrite 3 4 s = | Step_Mot_Test_Scan 4 4 s =
 SysPBA_IO_Scn_GPOTest 4 1 s = | UART_Test_SCN 4 1 s = | GetShadingData 1 4 s = | ScanJobTest1 1 1 s =
 ScanJobTest2 2 1 s = | ScanJobTest3 3 1 s = | ScanJobTest4 4 1 s = | ScanBalanceCorrection 1 1 s =)";
 
-struct Entry {
-    std::string name, function;
-    unsigned count, kind;
-    char target;
-};
+struct Entry { std::string name, function; unsigned count, kind; char target; };
 
 TEST(Registry, EveryNameHasItsCountKindTargetAndSharesAnEntryOnlyWithItsFunction) {
     MAA_SymbolClear();

@@ -66,6 +66,7 @@ TEST_F(ScanDriver, TheRecordCarriesTheBufferJobAndLine) {
 
 TEST_F(ScanDriver, FailuresAreOneRecordAndTheLockIsNeverLeftHeld) {
     const std::vector<unsigned long> thirtyOneLocks(31, IOCNR_SCAN_APP_LOCK);  // never released, never tested
+    const std::string failedControl = "critical error! failed to control device";
     struct Case {
         std::function<void()> script;
         std::string text;
@@ -73,8 +74,8 @@ TEST_F(ScanDriver, FailuresAreOneRecordAndTheLockIsNeverLeftHeld) {
         size_t pauses;
     } cases[] = {
         {[] { vdev::SetScanLockDefault(0); }, "scanner is busy or in sleep", thirtyOneLocks, 30},
-        {[] { Answer("never sent", std::nullopt, 5); }, "critical error! failed to control device", kLockTestRelease, 0},
-        {[] { Answer("never sent", std::nullopt, -EIO); }, "critical error! failed to control device", kLockTestRelease, 0},
+        {[] { Answer("never sent", std::nullopt, 5); }, failedControl, kLockTestRelease, 0},
+        {[] { Answer("never sent", std::nullopt, -EIO); }, failedControl, kLockTestRelease, 0},
         {[] { vdev::SetPresent(vdev::kScanner, false); }, "critical error! failed to open scan device", {}, 0},
     };
     for (const Case &c : cases) {
@@ -120,9 +121,8 @@ TEST_F(ScanDriver, OnlyTheReportedCountIsSentAndNeverMoreThanTheBuffer) {
 }
 
 TEST_F(ScanDriver, SFRReadWriteRefusesAnUnmappedAddressAndCutsALongText) {
-    char text[] = "REG_A";
-    const U32 addr = MAA_AddrMap(text, sizeof text);
-    for (U32 bad : {0u, kMax, addr + static_cast<U32>(sizeof text), 0x00100000u}) {
+    const U32 addr = Map("REG_A");
+    for (U32 bad : {0u, kMax, addr + 6, 0x00100000u}) {
         SCOPED_TRACE(bad);
         Restart();
         EXPECT_EQ(Seen(SFRReadWrite(1, bad, 2)), (Recs{End("critical error! invalid text argument", 0),
@@ -131,16 +131,13 @@ TEST_F(ScanDriver, SFRReadWriteRefusesAnUnmappedAddressAndCutsALongText) {
     }
     std::string longText(400, 't');
     Answer(Frame(MAA_RESULT_END, 1, "ok"));
-    SFRReadWrite(1, MAA_AddrMap(longText.data(), static_cast<U32>(longText.size() + 1)), 2);
+    SFRReadWrite(1, Map(longText), 2);
     EXPECT_EQ(vdev::ScanCommands(),
               std::vector<std::string>{("SFRReadWrite(1,\"" + longText).substr(0, SCAN_MAA_COMMAND_LENGTH - 1)});
 }
 
 TEST_F(ScanDriver, GetADFInfoReturnsTheMechanismForTheShellToWrite) {
-    struct Case {
-        std::function<void()> script;
-        Recs seen;
-    } cases[] = {
+    struct Case { std::function<void()> script; Recs seen; } cases[] = {
         {[] { vdev::SetADFMecha(3, 258, 2); }, {Cont("[ GetADFInfo ]"), End("ADFType=3 MultiType=2 Version=258", 1)}},
         {[] { vdev::SetPresent(vdev::kScanner, false); },
          {Cont("[ GetADFInfo ]"), End("critical error! failed to open scan device", 1)}},

@@ -27,17 +27,12 @@ class Supplies : public FnTest {
 protected:
     void SetUp() override {
         FnTest::SetUp();
-        ASSERT_EQ(::socketpair(AF_UNIX, SOCK_SEQPACKET, 0, sp), 0);
-        ulDrvHandle = static_cast<U32>(sp[0]);
+        ASSERT_GE(packets.device, 0);
+        ulDrvHandle = static_cast<U32>(packets.device);
         std::filesystem::create_directories(root / "/halvard/sys/portability/printdid");
     }
-    void TearDown() override {
-        ::close(sp[0]);
-        ::close(sp[1]);
-        FnTest::TearDown();
-    }
     void Put(const char *fixed, const std::string &bytes) { std::ofstream(root / fixed, std::ios::binary) << bytes; }
-    int sp[2] = {-1, -1};
+    PacketChannel packets;
 };
 
 TEST_F(Supplies, ReportHoldsTheDataVersionLineAndIsUploaded) {
@@ -45,7 +40,7 @@ TEST_F(Supplies, ReportHoldsTheDataVersionLineAndIsUploaded) {
     Put(kSupplies, raw);
     EXPECT_EQ(Seen(Get_SuppliesInfo_Report()), (Recs{Cont("[ GetSuppliesInfoReport ]"), End("Data Upload Complete")}));
     EXPECT_EQ(ReadFile(root / kReport), line);
-    EXPECT_EQ(Writes(sp[1]), (std::vector<std::string>{Transfer(MAA_FILE_TRANS_T2H, line.size()), line,
+    EXPECT_EQ(packets.Writes(), (std::vector<std::string>{Transfer(MAA_FILE_TRANS_T2H, line.size()), line,
                                                        Transfer(MAA_FILE_END, 0)}));
     // The whole record is loaded, in the file's byte order.
     EXPECT_EQ(std::memcmp(&gstSuppliesInfoData, raw.data(), raw.size()), 0);
@@ -70,7 +65,7 @@ TEST_F(Supplies, WithoutAVersionWordNothingIsUploaded) {
         Put(kReport, "DataVersion = 0x00000001\r\n");  // an earlier run's report
         written.clear();
         EXPECT_EQ(Seen(Get_SuppliesInfo_Report()), (Recs{Cont("[ GetSuppliesInfoReport ]"), End("Fil")}));
-        EXPECT_TRUE(Writes(sp[1]).empty());
+        EXPECT_TRUE(packets.Writes().empty());
         EXPECT_FALSE(std::filesystem::exists(root / kReport));
     }
 }
@@ -78,12 +73,7 @@ TEST_F(Supplies, WithoutAVersionWordNothingIsUploaded) {
 TEST_F(Supplies, UploadSendsASpoolFileOrFailsWithThreeCharacters) {
     Put("/halvard/spool/tmp/upload.bin", std::string("a\0b", 3));
     std::filesystem::create_directories(root / "/halvard/spool/tmp/adir");
-    struct Case {
-        std::string name;
-        S32 result;
-        std::string message;
-        std::vector<std::string> writes;
-    } cases[] = {
+    struct Case { std::string name; S32 result; std::string message; std::vector<std::string> writes; } cases[] = {
         {"upload.bin", 0, "", {Transfer(MAA_FILE_TRANS_T2H, 3), std::string("a\0b", 3), Transfer(MAA_FILE_END, 0)}},
         {"missing.txt", -4, "Fil", {}},
         {"adir", -4, "Fil", {}},
@@ -95,14 +85,12 @@ TEST_F(Supplies, UploadSendsASpoolFileOrFailsWithThreeCharacters) {
         char message[MAA_UPLOAD_MESSAGE_SIZE] = {};
         EXPECT_EQ(UploadFileData(c.name.c_str(), message), c.result);
         EXPECT_EQ(std::string(message), c.message);
-        EXPECT_EQ(Writes(sp[1]), c.writes);
+        EXPECT_EQ(packets.Writes(), c.writes);
     }
 }
 
 TEST(CrumStrings, SizesOfTheStringFields) {
-    struct Case {
-        U32 unit, field, size;
-    } cases[] = {
+    struct Case { U32 unit, field, size; } cases[] = {
         {0, 19, 8},  {0, 20, 8},  {0, 27, 8},  {0, 28, 8},   {0, 29, 8},  {0, 30, 8},
         {0, 21, 16}, {0, 24, 16}, {0, 25, 16}, {26, 26, 16}, {0, 50, 16}, {0, 49, 4},
         {27, 19, 0}, {0xFFFFFFFF, 21, 0},      {0, 0, 0},    {0, 22, 0},  {0, 51, 0},

@@ -12,11 +12,7 @@ namespace {
 using SysResult = FnTest;
 
 TEST_F(SysResult, ModeAndScannerSelectWhatIsWrittenAndReturned) {
-    struct Case {
-        U32 mode, scanner;
-        bool writtenAtOnce;
-        Rec returned;
-    } cases[] = {
+    struct Case { U32 mode, scanner; bool writtenAtOnce; Rec returned; } cases[] = {
         {0, 0, true, Cont("line", 1)},  {1, 0, false, End("line", 1)},     {7, 0, false, End("", 0)},
         {0, 2, true, End("line", 0)},   {5, 2, true, End("line", 0)},      {1, 0x300, false, End("line", 1)},
         {0, 0x302, true, End("line", 0)},  // only the low byte counts

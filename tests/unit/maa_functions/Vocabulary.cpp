@@ -1,36 +1,20 @@
 // Calling the registered vocabulary through the shell the way a host script
 // does: names that reach a family's shared function, and every name called
 // with hostile arguments.
-#include "maa/functions/MAA_Panel.h"
-#include "maa/functions/MAA_SysResult.h"
 #include "maa_functions/FnFixture.h"
 
 namespace fntest {
 namespace {
 
-class Vocabulary : public FnTest {
-protected:
-    void SetUp() override {
-        FnTest::SetUp();
-        MAA_PanelSetWaits(50, 50, 50);  // no UI server answers here
-    }
-    void TearDown() override {
-        MAA_PanelSetWaits(0, 0, 0);
-        FnTest::TearDown();
-    }
-};
+using Vocabulary = FnTest;
 
 TEST_F(Vocabulary, NamesReachTheirFunctionsWithTheirHeaders) {
-    struct Case {
-        const char *line;
-        Recs records;
-        const char *logged;
-        std::vector<U32> pauses;
-    } cases[] = {
+    struct Case { const char *line; Recs records; const char *logged; std::vector<U32> pauses; } cases[] = {
         // A forwarded family, without the Java service.
         {"SysPBA_DramTest(1)", {Cont("[ GetRamSize ]"), End("Failed")}, "", {}},
         // The engine interface, not the toner sensor's first registration ("[ GetTonerSensorStatus ]").
-        {"Get_TonerSensorStatus(1)", {Cont("[ Get_TonerSensorStatus ]"), End("Failed")}, "[Eng_MaaStrNormalTest] Start===>", {}},
+        {"Get_TonerSensorStatus(1)", {Cont("[ Get_TonerSensorStatus ]"), End("Failed")},
+         "[Eng_MaaStrNormalTest] Start===>", {}},
         // Delay pauses for its argument up to a minute.
         {"Delay_ms(250)", {End("Delay 250 ms DONE")}, "", {250}},
         {"Delay_ms(0xFFFFFFFF)", {End("Delay 60000 ms DONE")}, "", {60000}},

@@ -23,6 +23,7 @@
 #include "maa/MAA_MM.h"
 #include "maa/MAA_Result.h"
 #include "maa/MAA_Symbol.h"
+#include "print/PrintRecorder.h"
 #include "support/MaaRecords.h"
 #include "vdev.h"
 #include "vendor/VLX_Main.h"
@@ -31,9 +32,6 @@ namespace maasession {
 
 using namespace maarec;
 
-inline const std::string kAck("\x1bwMAA-OK", 8);
-// A special command line, host to device.
-inline std::string Special(U8 code, U32 size) { return std::string("#$%") + static_cast<char>(code) + BE32(size) + "\r"; }
 // A literal with NUL bytes in it.
 template <size_t N>
 std::string S(const char (&text)[N]) {
@@ -41,16 +39,31 @@ std::string S(const char (&text)[N]) {
 }
 inline std::string Str(const std::vector<uint8_t> &v) { return std::string(v.begin(), v.end()); }
 
-// A registered function (kind 1): its argument is its result code.
+// Registered functions (kind 1). A probe's argument is its result code; a
+// peek's result text is the bytes at an address ("unreachable" when the
+// address is not a live buffer), as a test function consuming a download.
 inline std::vector<U32> probes;
-inline TMAAResult stProbe;
-inline std::string probeText;
+inline TMAAResult *Reply(U32 result, std::string text) {
+    static TMAAResult stReply;
+    static std::string kept;
+    kept = std::move(text);
+    stReply = {MAA_RESULT_END, result, static_cast<U32>(kept.size()), reinterpret_cast<U8 *>(kept.data())};
+    return &stReply;
+}
 inline TMAAResult *probe(U32 n) {
     probes.push_back(n);
-    probeText = "probe " + std::to_string(n);
-    stProbe = {MAA_RESULT_END, n, static_cast<U32>(probeText.size()),
-               reinterpret_cast<U8 *>(probeText.data())};
-    return &stProbe;
+    return Reply(n, "probe " + std::to_string(n));
+}
+inline TMAAResult *peek(U32 address, U32 size) {
+    const void *p = MAA_AddrTranslate(address, size);
+    return Reply(1, p ? std::string(static_cast<const char *>(p), size) : "unreachable");
+}
+inline std::string PeekLine(U32 address, U32 size) {
+    return "peek(" + std::to_string(address) + ", " + std::to_string(size) + ")\r";
+}
+// The big-endian word at `at` of what the host received, or 0.
+inline U32 WordAt(const std::string &received, size_t at) {
+    return received.size() >= at + 4 ? ReadBE32(reinterpret_cast<const U8 *>(received.data() + at)) : 0;
 }
 
 // Runs fn on a thread; if it has not returned in time the cable is pulled
@@ -86,10 +99,10 @@ protected:
         MAA_AddrReset();
         probes.clear();
         MAA_SymbolAdd(ftarget_ppc, "probe", MAA_SYM_FUNC, MAA_FuncEntry<probe>(), 1);
+        MAA_SymbolAdd(ftarget_ppc, "peek", MAA_SYM_FUNC, MAA_FuncEntry<peek>(), 2);
         LoggerHost_StartCapture();
-        fd = ::open(vdev::kPrn, O_RDWR);
+        Reopen();
         ASSERT_GT(fd, 0);
-        ulDrvHandle = static_cast<U32>(fd);
     }
     void TearDown() override {
         ::close(fd);
@@ -98,6 +111,14 @@ protected:
         MAA_SymbolClear();
         MAA_SetResultWriter(nullptr);
         LoggerHost_StopCapture();
+    }
+
+    // A fresh print node and channel.
+    void Reopen() {
+        if (fd > 0) ::close(fd);
+        vdev::Reset();
+        fd = ::open(vdev::kPrn, O_RDWR);
+        ulDrvHandle = static_cast<U32>(fd);
     }
 
     // The classifier has taken ESC "w"; the host sends `transfers`, then stays
@@ -117,6 +138,23 @@ protected:
     }
 
     int fd = -1;
+};
+
+// The whole road through the print reader and the classifier.
+class SessionRoad : public ReaderTest {
+protected:
+    void SetUp() override {
+        ReaderTest::SetUp();
+        IsDisconnected = 0;
+        MAA_SymbolClear();
+        probes.clear();
+        MAA_SymbolAdd(ftarget_ppc, "probe", MAA_SYM_FUNC, MAA_FuncEntry<probe>(), 1);
+    }
+    void TearDown() override {
+        MAA_SymbolClear();
+        MAA_SetResultWriter(nullptr);
+        ReaderTest::TearDown();
+    }
 };
 
 }  // namespace maasession

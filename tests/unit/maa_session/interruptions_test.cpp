@@ -39,32 +39,32 @@ protected:
     }
 };
 
-TEST_F(SessionSignals, StartCommandArrivingLateStillOpensTheSession) {
-    Outcome o = SessionUnderSignals([] {
-        SendLate("MAAST");
-        SendLate("ART");
-        SendLate("probe(2)\r");
-        SendLate("MAA-STOP\r");
-    });
-    EXPECT_EQ(o.ret, 0) << "a signal was taken for the end of the start command";
-    EXPECT_EQ(o.wire, kAck + Frame(1, 2, "probe 2") + kAck);
-    EXPECT_GT(SignalStorm::Delivered(), 0);
-}
-
-TEST_F(SessionSignals, DownloadArrivingInPiecesIsNotCutShort) {
-    // Were the download cut short, its rest would run as command lines.
+// A start command or a download arriving in pieces under signals: a signal
+// taken for the end of the start command would refuse the session, a download
+// cut short would run its rest as command lines.
+TEST_F(SessionSignals, PiecesArrivingLateAreNotCutShort) {
     const std::string file = "probe(9)\rprobe(9)\rprobe(9)\r";
-    Outcome o = SessionUnderSignals([&] {
-        SendLate("MAASTART");
-        SendLate(Special(MAA_FILE_TRANS_H2T, static_cast<U32>(file.size())) + file.substr(0, 4));
-        SendLate(file.substr(4, 10));
-        SendLate(file.substr(14));
-        SendLate("probe(5)\rMAA-STOP\r");
-    });
-    EXPECT_EQ(o.ret, 0);
-    EXPECT_EQ(probes, std::vector<U32>{5});
-    ASSERT_EQ(o.wire.size(), kAck.size() + 4 + Frame(1, 5, "probe 5").size() + kAck.size());
-    EXPECT_EQ(o.wire.substr(12), Frame(1, 5, "probe 5") + kAck);
+    const std::string announce = Special(MAA_FILE_TRANS_H2T, static_cast<U32>(file.size()));
+    struct Row { const char *name; std::vector<std::string> pieces; U32 probe; size_t address; } rows[] = {
+        {"start command", {"MAAST", "ART", "probe(2)\r", "MAA-STOP\r"}, 2, 0},
+        {"download",
+         {"MAASTART", announce + file.substr(0, 4), file.substr(4, 10), file.substr(14), "probe(5)\rMAA-STOP\r"}, 5, 4},
+    };
+    for (const Row &r : rows) {
+        SCOPED_TRACE(r.name);
+        Reopen();
+        probes.clear();
+        Outcome o = SessionUnderSignals([&] {
+            for (const std::string &p : r.pieces) SendLate(p);
+        });
+        EXPECT_EQ(o.ret, 0);
+        EXPECT_EQ(probes, std::vector<U32>{r.probe});
+        const std::string tail = Frame(1, r.probe, "probe " + std::to_string(r.probe)) + kAck;
+        ASSERT_EQ(o.wire.size(), kAck.size() + r.address + tail.size());
+        EXPECT_EQ(o.wire.substr(0, kAck.size()), kAck);
+        EXPECT_EQ(o.wire.substr(kAck.size() + r.address), tail);
+    }
+    EXPECT_GT(SignalStorm::Delivered(), 0);
 }
 
 // A channel that says it is ready and gives nothing: hung up (the node's
@@ -73,10 +73,7 @@ TEST_F(SessionSignals, DownloadArrivingInPiecesIsNotCutShort) {
 TEST_F(SessionTest, LineReaderDoesNotSpinOnAChannelThatGivesNothing) {
     const int closed = ::dup(fd);
     ::close(closed);
-    const struct {
-        const char *name;
-        int handle;
-    } rows[] = {{"hung up", fd}, {"closed", closed}};
+    const struct { const char *name; int handle; } rows[] = {{"hung up", fd}, {"closed", closed}};
     vdev::Reset();
     for (const auto &r : rows) {
         SCOPED_TRACE(r.name);
@@ -95,17 +92,9 @@ TEST_F(SessionTest, LineReaderDoesNotSpinOnAChannelThatGivesNothing) {
 
 // ---- through the reader: a cable pulled in the middle of a start command -------
 
-class StartCommandPull : public ReaderTest {
-protected:
-    void TearDown() override {
-        MAA_SetResultWriter(nullptr);
-        ReaderTest::TearDown();
-    }
-};
-
 // The bridge loses what the host had in flight when the cable goes, so no rest
 // of the start command is read as the beginning of the next job.
-TEST_F(StartCommandPull, NextPrintJobAfterReplugIsByteExact) {
+TEST_F(SessionRoad, StartCommandPulledMidwayLeavesTheNextPrintJobByteExact) {
     const std::string start = "\x1bwMAASTART";
     const std::string job = kUel + "@PJL JOB\r\npage" + kUel;
     LoggerHost_StopCapture();

@@ -16,11 +16,24 @@
 namespace maasession {
 namespace {
 
+// Runs `body` in a child that a hang cannot outlive (it is killed after
+// `seconds`); the child's exit code, or -1 when it did not exit by itself.
+int InChild(const std::function<int()> &body, unsigned seconds) {
+    const pid_t pid = ::fork();
+    if (pid == 0) {
+        ::alarm(seconds);
+        std::_Exit(body());
+    }
+    int status = 0;
+    if (pid < 0 || ::waitpid(pid, &status, 0) != pid) return -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
 class ResultTest : public ::testing::Test {
 protected:
     void SetUp() override {
-        ASSERT_EQ(::socketpair(AF_UNIX, SOCK_SEQPACKET, 0, sp), 0);
-        ulDrvHandle = static_cast<U32>(sp[0]);
+        ASSERT_GE(channel.device, 0);
+        ulDrvHandle = static_cast<U32>(channel.device);
         IsDisconnected = 0;
         enSpecialMode = MAA_NORMAL_CMD;
         MAA_AddrReset();
@@ -28,15 +41,13 @@ protected:
         LoggerHost_StartCapture();
     }
     void TearDown() override {
-        ::close(sp[0]);
-        ::close(sp[1]);
         IsDisconnected = 0;
         enSpecialMode = MAA_NORMAL_CMD;
         MAA_SetResultWriter(nullptr);
         LoggerHost_StopCapture();
     }
-    std::vector<std::string> Writes() { return maarec::Writes(sp[1]); }
-    int sp[2] = {-1, -1};
+    std::vector<std::string> Writes() { return channel.Writes(); }
+    PacketChannel channel;
 };
 
 TEST_F(ResultTest, FramesAndTheirWrites) {
@@ -47,46 +58,40 @@ TEST_F(ResultTest, FramesAndTheirWrites) {
     forwarded = Frame(1, 2, "xy");
     auto text = [](std::string &s) { return reinterpret_cast<U8 *>(s.data()); };
     auto size = [](const std::string &s) { return static_cast<U32>(s.size()); };
-    struct Row {
-        const char *name;
-        TMAASpecialMode mode;
-        std::function<void()> action;
-        std::vector<std::string> writes;
-    } rows[] = {
-        {"result without data", MAA_NORMAL_CMD,
-         [] { TMAAResult r{MAA_RESULT_END, 7, 0, nullptr}; MAA_WriteResult(&r); }, {Frame(1, 7, "")}},
-        {"result with text", MAA_NORMAL_CMD,
-         [&] { TMAAResult r{MAA_RESULT_CONTINUE, 0, 5, text(hello)}; MAA_IF_WriteResult(&r); },
+    auto Forward = [&](std::string &s) {
+        TMAAResult r{MAA_RESULT_CONTINUE, 0, size(s), text(s)};
+        MAA_WriteResultForward(&r);
+    };
+    struct Row { const char *name; std::function<void()> action; std::vector<std::string> writes; } rows[] = {
+        {"result without data", [] { TMAAResult r{MAA_RESULT_END, 7, 0, nullptr}; MAA_WriteResult(&r); },
+         {Frame(1, 7, "")}},
+        {"result with text", [&] { TMAAResult r{MAA_RESULT_CONTINUE, 0, 5, text(hello)}; MAA_IF_WriteResult(&r); },
          {Frame(0, 0, hello).substr(0, 12), hello}},
-        {"skip", MAA_NORMAL_CMD, [] { MAA_IF_SkipResult(); }, {std::string(12, '\0')}},
-        {"file end", MAA_NORMAL_CMD, [] { MAA_IF_FileEnd(); }, {Transfer(0xA0, 0)}},
-        {"file of 10000 bytes", MAA_NORMAL_CMD, [&] { MAA_IF_WriteFile(text(file), size(file)); },
+        {"skip", [] { MAA_IF_SkipResult(); }, {std::string(12, '\0')}},
+        {"file end", [] { MAA_IF_FileEnd(); }, {Transfer(0xA0, 0)}},
+        {"file of 10000 bytes", [&] { MAA_IF_WriteFile(text(file), size(file)); },
          {Transfer(1, 10000), file.substr(0, 4096), file.substr(4096, 4096), file.substr(8192)}},
-        {"scanner file", MAA_NORMAL_CMD, [&] { MAA_Scanner_WriteFile(text(file), 5000); },
+        {"scanner file", [&] { MAA_Scanner_WriteFile(text(file), 5000); },
          {file.substr(0, 4096), file.substr(4096, 904)}},
-        {"forwarded frames", MAA_NORMAL_CMD,
-         [&] { TMAAResult r{MAA_RESULT_CONTINUE, 0, size(mixed), text(mixed)}; MAA_WriteResultForward(&r); },
-         {mixed.substr(0, 12), "abc", Transfer(1, 5000), file.substr(0, 4096), file.substr(4096, 904), Transfer(0xA0, 0),
-          Transfer(1, 5), Frame(1, 1, "")}},
-        {"forwarded frame cut short", MAA_NORMAL_CMD,
-         [&] { TMAAResult r{MAA_RESULT_CONTINUE, 0, size(cut), text(cut)}; MAA_WriteResultForward(&r); },
-         {cut.substr(0, 12), "xxxxx"}},
-        {"file forward", MAA_NORMAL_CMD, [&] { MAA_WriteFileForward(text(forwarded), size(forwarded)); },
+        {"forwarded frames", [&] { Forward(mixed); },
+         {mixed.substr(0, 12), "abc", Transfer(1, 5000), file.substr(0, 4096), file.substr(4096, 904),
+          Transfer(0xA0, 0), Transfer(1, 5), Frame(1, 1, "")}},
+        {"forwarded frame cut short", [&] { Forward(cut); }, {cut.substr(0, 12), "xxxxx"}},
+        {"file forward", [&] { MAA_WriteFileForward(text(forwarded), size(forwarded)); },
          {forwarded.substr(0, 12), "xy"}},
-        {"acknowledgement", MAA_NORMAL_CMD, [] { MAA_ResponseOK(); }, {kAck}},
-        {"auto run", MAA_AUTO_RUN_CMD,
+        {"acknowledgement", [] { MAA_ResponseOK(); }, {kAck}},
+        {"auto run",
          [&] {
+             enSpecialMode = MAA_AUTO_RUN_CMD;
              TMAAResult r{MAA_RESULT_END, 1, 5, text(hello)};
              MAA_WriteResult(&r);
              MAA_IF_SkipResult();
-             r = {MAA_RESULT_CONTINUE, 0, size(forwarded), text(forwarded)};
-             MAA_WriteResultForward(&r);
+             Forward(forwarded);
          },
          {}},
     };
     for (const Row &r : rows) {
         SCOPED_TRACE(r.name);
-        enSpecialMode = r.mode;
         r.action();
         EXPECT_EQ(Writes(), r.writes);
     }
@@ -126,15 +131,10 @@ TEST_F(ResultTest, DumpFileSendsLinesUntilTheFirstEmptyOne) {
         if (r.content) std::ofstream(root / path) << r.content;
         TMAAResult *res = Dump_File(address);
         std::vector<std::string> want;
-        for (const std::string &l : r.lines) {
-            want.push_back(BE32(0) + BE32(0) + BE32(static_cast<U32>(l.size())));
-            want.push_back(l);
-        }
+        for (const std::string &l : r.lines) want.insert(want.end(), {Frame(0, 0, l).substr(0, 12), l});
         EXPECT_EQ(Writes(), want);
         ASSERT_NE(res, nullptr);
-        EXPECT_EQ(res->enContinue, MAA_RESULT_END);
-        EXPECT_EQ(res->ulResult, r.result);
-        EXPECT_EQ(std::string(reinterpret_cast<char *>(res->pubData), res->ulDataSize), r.last);
+        EXPECT_EQ(Of(res), End(r.last, r.result));
     }
 }
 
@@ -147,20 +147,8 @@ TEST_F(ResultTest, DumpFileRefusesWhatIsNoTextFileAndStopsWhenTheHostIsGone) {
     for (std::string path : {"/halvard/zero", "/halvard/fifo"}) {
         SCOPED_TRACE(path);
         const U32 address = MAA_AddrMap(path.data(), static_cast<U32>(path.size() + 1));
-        const pid_t pid = ::fork();
-        ASSERT_GE(pid, 0);
-        if (pid == 0) {
-            ::alarm(5);
-            TMAAResult *res = Dump_File(address);
-            const bool refused = res != nullptr && res->ulResult == 0 && res->enContinue == MAA_RESULT_END &&
-                                 std::string(reinterpret_cast<char *>(res->pubData), res->ulDataSize) ==
-                                     "File Open Error " + path;
-            ::_exit(refused ? 0 : 1);
-        }
-        int status = 0;
-        ASSERT_EQ(::waitpid(pid, &status, 0), pid);
-        EXPECT_FALSE(WIFSIGNALED(status)) << "still dumping after 5 s";
-        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "not answered with the open error";
+        EXPECT_EQ(InChild([&] { return Of(Dump_File(address)) == End("File Open Error " + path, 0) ? 0 : 1; }, 5), 0)
+            << "-1: still dumping after 5 s, 1: not answered with the open error";
         EXPECT_TRUE(Writes().empty());
         MAA_AddrUnmap(address);
     }
@@ -210,9 +198,7 @@ TEST(StartUp, SerialStringIsFollowedByTheModelSeries) {
 // thread. Run in a child: the reader never ends.
 TEST(StartUp, CompEntryOpensTheShellQueueAndStartsTheReader) {
     TempRoot root;
-    const pid_t pid = ::fork();
-    ASSERT_GE(pid, 0);
-    if (pid == 0) {
+    const int status = InChild([&] {
         const bool existed = ::msgget(1234, 0) >= 0;
         int code = MAA_CompEntry(0) == 1 ? 0 : 1;
         for (int i = 0; i < 500 && !startreading_enter; ++i) std::this_thread::sleep_for(std::chrono::milliseconds(10));
@@ -220,17 +206,9 @@ TEST(StartUp, CompEntryOpensTheShellQueueAndStartsTheReader) {
         if (ulMAAMsgQueueID < 0 || ulMAAMsgQueueID != ::msgget(1234, 0)) code |= 4;
         if (ReadFile(root / "/halvard/sys/statusinfo/usb_speed.txt") != "HIGH") code |= 8;
         if (!existed) ::msgctl(ulMAAMsgQueueID, IPC_RMID, nullptr);
-        std::_Exit(code);
-    }
-    int status = -1;
-    for (int i = 0; i < 1000 && ::waitpid(pid, &status, WNOHANG) == 0; ++i)
-        std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    if (status == -1) {
-        ::kill(pid, SIGKILL);
-        ::waitpid(pid, &status, 0);
-    }
-    ASSERT_TRUE(WIFEXITED(status));
-    EXPECT_EQ(WEXITSTATUS(status), 0) << "1 entry result, 2 reader, 4 queue, 8 usb_speed.txt";
+        return code;
+    }, 10);
+    EXPECT_EQ(status, 0) << "-1 hung, 1 entry result, 2 reader, 4 queue, 8 usb_speed.txt";
 }
 
 }  // namespace

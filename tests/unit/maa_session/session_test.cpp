@@ -3,7 +3,6 @@
 #include <thread>
 
 #include "maa_session/SessionFixture.h"
-#include "print/PrintRecorder.h"
 #include "support/WaitUntil.h"
 
 namespace maasession {
@@ -33,9 +32,7 @@ TEST_F(SessionTest, StartCommandDecidesWhoOwnsTheBytes) {
         EXPECT_EQ(o.command.substr(0, r.command.size()), r.command);
         EXPECT_EQ(o.wire, r.wire);
         EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), r.left);
-        ::close(fd);
-        vdev::Reset();
-        fd = ::open(vdev::kPrn, O_RDWR);
+        Reopen();
     }
 }
 
@@ -49,10 +46,7 @@ TEST_F(SessionTest, FirstWaitIsFiveMinutesLaterOnesFiveSeconds) {
 }
 
 TEST(CheckCommand, BalanceOfQuotesParenthesesAndBrackets) {
-    struct Row {
-        const char *line;
-        U32 ok;
-    } rows[] = {
+    struct Row { const char *line; U32 ok; } rows[] = {
         {"123", 0}, {"\t9x", 0}, {"x9", 1}, {"  f(1)", 1}, {"f(1;", 0}, {"f(\"(\")", 0},
         {"f(1); g(2)", 1}, {"f(1;2)", 0}, {"a[1] = f(2)", 1}, {"f[1)", 0}, {")(", 1},
         {"\"a\" \"b\"", 1}, {"", 1},
@@ -61,11 +55,7 @@ TEST(CheckCommand, BalanceOfQuotesParenthesesAndBrackets) {
 }
 
 TEST_F(SessionTest, LineEndsAtCrLfOrTheLimitAndTakesEightRawBytesBehindAHash) {
-    struct Row {
-        const char *name;
-        std::string sent;
-        std::vector<std::string> lines;
-    } rows[] = {
+    struct Row { const char *name; std::string sent; std::vector<std::string> lines; } rows[] = {
         {"CR and LF", "ab\r\ncd\n", {"ab", "", "cd"}},
         {"limit", std::string(1030, 'a') + "\r", {std::string(1025, 'a'), "aaaaa"}},
         {"hash, raw CR last", S("x#\r\n\0y\0\0\0\rz\r"), {S("x#\r\n\0y\0\0\0\r"), "z"}},
@@ -85,31 +75,15 @@ TEST_F(SessionTest, LineEndsAtCrLfOrTheLimitAndTakesEightRawBytesBehindAHash) {
     }
 }
 
-// A test function that consumes a download: the bytes at an address, as its
-// result text ("unreachable" when the address is not a live buffer).
-std::string peekText;
-TMAAResult stPeek;
-TMAAResult *peek(U32 address, U32 size) {
-    const void *p = MAA_AddrTranslate(address, size);
-    peekText = p ? std::string(static_cast<const char *>(p), size) : "unreachable";
-    stPeek = {MAA_RESULT_END, 1, static_cast<U32>(peekText.size()), reinterpret_cast<U8 *>(peekText.data())};
-    return &stPeek;
-}
-
-std::string PeekLine(U32 address, U32 size) {
-    return "peek(" + std::to_string(address) + ", " + std::to_string(size) + ")\r";
-}
-
 TEST_F(SessionTest, DownloadSendsItsAddressAndTakesExactlyTheAnnouncedBytes) {
     const std::string raw = S("\nMAA-STOP\r\0#$%(\n");
     ASSERT_EQ(raw.size(), 16u);
-    MAA_SymbolAdd(ftarget_ppc, "peek", MAA_SYM_FUNC, MAA_FuncEntry<peek>(), 2);
     U32 address = 0;
     std::string early;  // what the host had received when it sent the peeks
     Outcome o = Session({"MAASTART", Special(MAA_FILE_TRANS_H2T, 16) + raw.substr(0, 5), raw.substr(5) + "probe(4)\r"},
                         0, [&] {
                             early = Str(vdev::HostReadAtLeast(vdev::kPrn, 12, 5000));
-                            if (early.size() >= 12) address = ReadBE32(reinterpret_cast<const U8 *>(early.data() + 8));
+                            address = WordAt(early, 8);
                             vdev::HostWrite(vdev::kPrn, PeekLine(address, 16) + PeekLine(address, 17) + "MAA-STOP\r");
                         });
     EXPECT_EQ(o.ret, 0);
@@ -123,14 +97,12 @@ TEST_F(SessionTest, DownloadSendsItsAddressAndTakesExactlyTheAnnouncedBytes) {
 // A download the host stops sending in the middle ends at the time-out; what
 // did not arrive reads as zero bytes.
 TEST_F(SessionTest, DownloadCutByATimeOutLeavesZerosWhereNothingArrived) {
-    MAA_SymbolAdd(ftarget_ppc, "peek", MAA_SYM_FUNC, MAA_FuncEntry<peek>(), 2);
     std::string early;
     Outcome o = Session({"MAASTART", Special(MAA_FILE_TRANS_H2T, 10) + "abcd"}, 0, [&] {
         early = Str(vdev::HostReadAtLeast(vdev::kPrn, 12, 5000));
         vdev::ExpirePoll(vdev::kPrn, 1);
         WaitUntil([] { return vdev::ExpiredPolls(vdev::kPrn) == 1; }, 5000);
-        const U32 address = early.size() >= 12 ? ReadBE32(reinterpret_cast<const U8 *>(early.data() + 8)) : 0;
-        vdev::HostWrite(vdev::kPrn, PeekLine(address, 10) + "MAA-STOP\r");
+        vdev::HostWrite(vdev::kPrn, PeekLine(WordAt(early, 8), 10) + "MAA-STOP\r");
     });
     EXPECT_EQ(o.ret, 0);
     EXPECT_EQ(o.wire, Frame(1, 1, S("abcd\0\0\0\0\0\0")) + kAck);
@@ -140,16 +112,14 @@ TEST_F(SessionTest, DownloadCutByATimeOutLeavesZerosWhereNothingArrived) {
 // Factory scripts download several files, then pass each address on: every
 // download of a session stays addressable until the session ends.
 TEST_F(SessionTest, EveryDownloadOfASessionStaysAddressableUntilItEnds) {
-    MAA_SymbolAdd(ftarget_ppc, "peek", MAA_SYM_FUNC, MAA_FuncEntry<peek>(), 2);
     const std::vector<std::string> files = {"first file", std::string(5000, 'b'), "third"};
     std::vector<U32> addresses;
     Outcome o = Session({"MAASTART"}, 0, [&] {
         EXPECT_EQ(Str(vdev::HostReadAtLeast(vdev::kPrn, 8, 5000)), kAck);
         for (const std::string &f : files) {
             vdev::HostWrite(vdev::kPrn, Special(MAA_FILE_TRANS_H2T, static_cast<U32>(f.size())) + f);
-            std::string got = Str(vdev::HostReadAtLeast(vdev::kPrn, 4, 5000));
-            ASSERT_EQ(got.size(), 4u);
-            addresses.push_back(ReadBE32(reinterpret_cast<const U8 *>(got.data())));
+            addresses.push_back(WordAt(Str(vdev::HostReadAtLeast(vdev::kPrn, 4, 5000)), 0));
+            ASSERT_NE(addresses.back(), 0u);
         }
         std::string lines;
         for (size_t i = files.size(); i-- > 0;) lines += PeekLine(addresses[i], static_cast<U32>(files[i].size()));
@@ -251,22 +221,6 @@ TEST_F(SessionTest, DriverLayerReadsWhatIsAskedUpToAPieceAndHidesWriteErrorsButN
 }
 
 // ---- the whole road through the print reader and the classifier -------------------
-
-class SessionRoad : public ReaderTest {
-protected:
-    void SetUp() override {
-        ReaderTest::SetUp();
-        IsDisconnected = 0;
-        MAA_SymbolClear();
-        probes.clear();
-        MAA_SymbolAdd(ftarget_ppc, "probe", MAA_SYM_FUNC, MAA_FuncEntry<probe>(), 1);
-    }
-    void TearDown() override {
-        MAA_SymbolClear();
-        MAA_SetResultWriter(nullptr);
-        ReaderTest::TearDown();
-    }
-};
 
 TEST_F(SessionRoad, WrongStartCommandIsPrintData) {
     Send({"\x1bwMAASTARX", "rest of the job"});
