@@ -20,6 +20,24 @@ U8 aubDMBuf[DM_READ_PIECE_MAX];
 
 bool cableGone() { return MAA_IsUSBDisconnected() != 0; }
 
+// One read of the node takes what the host's transfer holds (up to this
+// much); what the caller did not ask for is put back in front of the node, so
+// the line readers' one-byte reads and the download's pieces cost no system
+// call until it is used up, and whoever reads the node after the session
+// (the print reader) still finds the bytes behind the session's last line.
+constexpr size_t kReadAhead = 64 << 10;
+U8 aubAhead[kReadAhead];
+
+ssize_t readAhead(int fd, U8 *dest, size_t size) {
+    if (Wait_PutBackLeft(fd) > 0) return Wait_Read(fd, dest, size, cableGone);
+    ssize_t n = Wait_Read(fd, aubAhead, kReadAhead, cableGone);
+    if (n <= 0) return n;
+    const size_t give = std::min(size, static_cast<size_t>(n));
+    std::memcpy(dest, aubAhead, give);
+    Wait_PutBack(fd, aubAhead + give, static_cast<size_t>(n) - give, static_cast<size_t>(n) == kReadAhead);
+    return static_cast<ssize_t>(give);
+}
+
 }  // namespace
 
 U32 DM_ReadDriverInto(U32 ulHandle, U8 *pubDest, U32 ulReadSize, U32 *pulReturnSize) {
@@ -38,7 +56,7 @@ U32 DM_ReadDriverInto(U32 ulHandle, U8 *pubDest, U32 ulReadSize, U32 *pulReturnS
     if (r < 1) {
         USBADP_LOG(DEBUG, "\r\n[MAA] No Data to read\n");
     } else {
-        count = Wait_Read(fd, pubDest, std::clamp<U32>(ulReadSize, 1, DM_READ_PIECE_MAX), cableGone);
+        count = readAhead(fd, pubDest, std::clamp<U32>(ulReadSize, 1, DM_READ_PIECE_MAX));
         stopped = count < 0 && errno == EINTR;
     }
     if (count < 1) {

@@ -25,6 +25,7 @@
 #include "maa/MAA_Symbol.h"
 #include "print/PrintRecorder.h"
 #include "support/MaaRecords.h"
+#include "common/Wait.h"
 #include "vdev.h"
 #include "vendor/VLX_Main.h"
 
@@ -117,6 +118,7 @@ protected:
     void Reopen() {
         if (fd > 0) ::close(fd);
         vdev::Reset();
+        Wait_PutBack(-1, nullptr, 0, false);
         fd = ::open(vdev::kPrn, O_RDWR);
         ulDrvHandle = static_cast<U32>(fd);
     }
@@ -136,6 +138,9 @@ protected:
     static std::string SavedCommands() {
         return std::string(reinterpret_cast<char *>(stCmdHeap.ulHeapPtr), stCmdHeap.ulHeapIndex + 1);
     }
+
+    // Host bytes nobody has taken yet: in the node, or read ahead and put back.
+    size_t Untaken() const { return vdev::PendingHostBytes(vdev::kPrn) + Wait_PutBackLeft(fd); }
 
     int fd = -1;
 };

@@ -107,7 +107,7 @@ TEST_F(Classifier, PrintDataIsHandedBackWithTheBytesTaken) {
             want.resize(static_cast<size_t>(r.firmRes), '\0');
             EXPECT_EQ(o.handedBack, want);
         }
-        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), r.left);
+        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn) + Wait_PutBackLeft(fdPrn), r.left);
         ExpectLoggedOnce(r.line);
     }
 }
