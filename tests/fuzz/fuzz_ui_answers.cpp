@@ -9,7 +9,7 @@
 // (little-endian), then the server's script, one step per byte (mod 5):
 //   0 n b...  send the n bytes behind (one write)
 //   1 b k     send (k + 1) * 64 bytes of b (one write)
-//   2         pause about a millisecond (the next send is a read of its own)
+//   2         pause 0.2 ms (the next send is likely a read of its own)
 //   3         close (the server's writing end; it then waits for the test to close)
 //   4         hold: send nothing more and wait for the test to close
 // A script that runs out closes. Every input checks: the records the host gets
@@ -57,7 +57,7 @@ namespace {
     } while (0)
 
 constexpr int kLongWaitMs = 3000;  // the panel's waits when an answer is due
-constexpr int kShortWaitMs = 2;    // when the server holds: the wait itself is the outcome
+constexpr int kShortWaitMs = 1;    // when the server holds: the wait itself is the outcome
 constexpr int kPeerWaitMs = 3000;  // any one step of the server thread
 
 // ---- the panel tests -----------------------------------------------------------
@@ -247,7 +247,7 @@ void serve(const Job &j, Outcome &o) {
             sendAll(fd, st.bytes);
             sent = true;
         } else if (st.op == Step::Pause) {
-            std::this_thread::sleep_for(std::chrono::milliseconds(1));
+            std::this_thread::sleep_for(std::chrono::microseconds(200));
         } else {
             break;
         }
