@@ -84,6 +84,8 @@ void onPoll() {
         idle = 0;
         return;
     }
+    // Separators in a row make one pause, not a time-out per pair.
+    while (nextPhase < phases.size() && phases[nextPhase].empty()) ++nextPhase;
     if (nextPhase < phases.size()) {
         sendNextPhase();
         idle = 0;
