@@ -46,7 +46,8 @@ for stage in "${stages[@]}"; do
       for t in "${targets[@]}"; do
         # Scratch corpus first, so the checked-in seeds are never rewritten.
         scratch="build/fuzz/corpus/$t"; mkdir -p "$scratch"
-        args=(-max_total_time="${FUZZ_SECONDS:-60}" -rss_limit_mb=2048 -max_len=1100 "$scratch")
+        # Six targets in about three minutes; a unit slower than 30 s is a hang.
+        args=(-max_total_time="${FUZZ_SECONDS:-25}" -timeout=30 -rss_limit_mb=2048 -max_len=1100 "$scratch")
         [ -f "tests/fuzz/$t.dict" ] && args=(-dict="tests/fuzz/$t.dict" "${args[@]}")
         [ -d "tests/fuzz/corpus/$t" ] && args+=("tests/fuzz/corpus/$t")
         echo "-- $t"

@@ -49,6 +49,7 @@ std::vector<std::string> Split(std::string_view s, std::string_view sep) {
 }
 
 int g_listen = -1;
+int g_wake[2] = {-1, -1};  // readable once the download has returned
 
 void Setup() {
     // fw.bin lands in the working directory; libFuzzer's paths are relative
@@ -64,6 +65,7 @@ void Setup() {
         fail("cannot listen");
     ::setenv(UPDATE_PORT_ENV, std::to_string(ntohs(a.sin_port)).c_str(), 1);
     UpdateManager_SetWaitMs(2);
+    if (::pipe2(g_wake, O_CLOEXEC) != 0) fail("no pipe");
     // The marks on standard output are not the fuzzer's business.
     if (!std::freopen("/dev/null", "w", stdout)) fail("no /dev/null");
 }
@@ -100,8 +102,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
         size_t next = 0;
         char buf[4096];
         while (!done) {
-            pollfd p{g_listen, POLLIN, 0};
-            if (::poll(&p, 1, 1) == 1) {
+            // The wake pipe ends the wait as soon as the download has returned.
+            pollfd p[2] = {{g_listen, POLLIN, 0}, {g_wake[0], POLLIN, 0}};
+            if (::poll(p, 2, 1) > 0 && p[0].revents != 0) {
                 int c = ::accept4(g_listen, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
                 if (c >= 0) {
                     if (next < answers.size())
@@ -124,7 +127,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     const S32 r = FirmWareDownload(fd, cmd, 2, out, &firmware);
     if (std::chrono::steady_clock::now() - t0 > std::chrono::seconds(10)) fail("download took more than 10 s");
     done = true;
+    char c = 'w';
+    if (::write(g_wake[1], &c, 1) != 1) fail("wake pipe");
     manager.join();
+    if (::read(g_wake[0], &c, 1) != 1) fail("wake pipe");
     ::close(fd);
     vdev::Reset();  // the host ends of the node
     if (r < -1 || r > FW_PJL_HEADER_SIZE) fail("result outside -1..80");

@@ -1,0 +1,266 @@
+// Test-shell sessions as the print channel hands them over (ESC "w" taken,
+// the rest on the emulated print node with instant time-outs): the start
+// command, lines, the special commands (downloads, saved-command modes), the
+// stop and the auto run behind it, and cable pulls at any point. The shell has
+// the probe functions, a download echo (T2H) and Dump_File (a short text "/t").
+//
+// Input: the host's traffic, in which
+//   FE FF  ends a host transfer,
+//   FE FE  ends a phase: the next phase is sent when the device waits for more,
+//   FE FD  pulls the cable once the device waits; what follows is the traffic
+//          of the next session, after the cable is back.
+// When a session waits with nothing left to send, the cable is pulled. The
+// device's polls are counted through a wrapper of the shell's poll wait (see
+// CMakeLists.txt): a session still polling long after the pull is a hang.
+//
+// Every session checks: what MAA_Hook returns and hands back, that a started
+// session answers the start and ends only by the stop or the cable, that the
+// stop is acknowledged, and that its downloads are gone afterwards.
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstddef>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "adapter/USB.h"
+#include "common/Wait.h"
+#include "maa/MAA_Address.h"
+#include "maa/MAA_Hook.h"
+#include "maa/MAA_IF.h"
+#include "maa/MAA_MM.h"
+#include "maa/MAA_Result.h"
+#include "maa/MAA_Symbol.h"
+#include "ShellProbes.h"
+#include "support/TempRoot.h"
+#include "vdev.h"
+
+namespace {
+
+[[noreturn]] void fail(const char *what) {
+    std::fprintf(stderr, "\n== fuzz_maa_session: %s\n", what);
+    std::abort();
+}
+#define CHECK(cond, what)        \
+    do {                         \
+        if (!(cond)) fail(what); \
+    } while (0)
+
+// Polls in a row with nothing to read before the host counts the device as
+// waiting, and polls after a pull before the session counts as hung.
+constexpr int kIdlePolls = 2;
+constexpr int kPollsAfterPull = 1000;
+
+using Phase = std::vector<std::string>;
+
+// The session under way: its phases still to send, and the host's patience.
+std::vector<Phase> phases;
+size_t nextPhase = 0;
+int idle = 0;
+bool pulled = false;
+int pollsAfterPull = 0;
+bool active = false;  // only the session's polls are the host's business
+
+void sendNextPhase() {
+    for (const std::string &t : phases[nextPhase]) vdev::HostWrite(vdev::kPrn, t.data(), t.size());
+    ++nextPhase;
+}
+
+// The host's view of one wait of the device: it sends the next phase, or pulls
+// the cable when it has nothing left.
+void onPoll() {
+    if (!active) return;
+    if (pulled) {
+        CHECK(++pollsAfterPull <= kPollsAfterPull, "the session still waits after the cable was pulled (hang)");
+        return;
+    }
+    if (vdev::PendingHostBytes(vdev::kPrn) > 0) {
+        idle = 0;
+        return;
+    }
+    // Separators in a row make one pause, not a time-out per pair.
+    while (nextPhase < phases.size() && phases[nextPhase].empty()) ++nextPhase;
+    if (nextPhase < phases.size()) {
+        sendNextPhase();
+        idle = 0;
+        return;
+    }
+    if (++idle >= kIdlePolls) {
+        pulled = true;
+        IsDisconnected = 1;
+    }
+}
+
+// The host's last download, sent back as a file (first 64 KiB).
+TMAAResult *echoDownload() {
+    U32 size = 0;
+    const U8 *p = MAA_DownloadBuffer(&size);
+    MAA_IF_WriteFile(p, p ? std::min<U32>(size, 64 * 1024) : 0);
+    MAA_IF_FileEnd();
+    return probes::done(MAA_RESULT_END);
+}
+
+void registerSymbols() {
+    probes::Register([] {
+        MAA_SymbolAdd(ftarget_ppc, "dl", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<echoDownload>(), 0);
+        MAA_SymbolAdd(ftarget_ppc, "Dump_File", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<Dump_File>(), 1);
+    });
+}
+
+// Splits one session's traffic into phases of transfers.
+std::vector<Phase> parsePhases(std::string_view d, std::string &all) {
+    std::vector<Phase> out(1);
+    std::string cur;
+    auto push = [&](bool evenEmpty) {
+        if (cur.empty() && !evenEmpty) return;
+        all += cur;
+        out.back().push_back(std::move(cur));
+        cur.clear();
+    };
+    for (size_t i = 0; i < d.size(); ++i) {
+        if (static_cast<U8>(d[i]) == 0xFE && i + 1 < d.size() &&
+            (static_cast<U8>(d[i + 1]) == 0xFF || static_cast<U8>(d[i + 1]) == 0xFE)) {
+            push(static_cast<U8>(d[i + 1]) == 0xFF);
+            if (static_cast<U8>(d[i + 1]) == 0xFE) out.emplace_back();
+            ++i;
+            continue;
+        }
+        cur.push_back(d[i]);
+    }
+    push(false);
+    return out;
+}
+
+bool startsWith(const std::vector<uint8_t> &w, std::string_view p) {
+    return w.size() >= p.size() && std::memcmp(w.data(), p.data(), p.size()) == 0;
+}
+
+const std::string_view kStart("MAASTART");
+const std::string_view kOk("\x1bwMAA-OK", 8);
+
+// A fresh print node: what the host had not sent is lost with the pull, and
+// what a stop left unread is the classifier's.
+void openNode() {
+    if (fdPrn > 0) ::close(fdPrn);
+    vdev::Reset();
+    fdPrn = ::open(vdev::kPrn, O_RDWR);
+    CHECK(fdPrn > 0, "the print node does not open");
+    vdev::SetInstantTimeouts(vdev::kPrn, true);
+}
+
+void runSession(std::string_view traffic) {
+    openNode();
+    std::string host;
+    phases = parsePhases(traffic, host);
+    // The start command is read up to the first empty transfer (a time-out).
+    const std::string beforeEmpty = [] {
+        std::string bytes;
+        for (const Phase &p : phases) {
+            for (const std::string &t : p) {
+                if (t.empty()) return bytes;
+                bytes += t;
+            }
+        }
+        return bytes;
+    }();
+    nextPhase = 0;
+    idle = 0;
+    pulled = false;
+    pollsAfterPull = 0;
+    IsDisconnected = 0;
+    maa_session::slPollTimeout = MAA_POLL_TIMEOUT_FIRST;
+    enSpecialMode = MAA_NORMAL_CMD;
+    MAA_SetResultWriter(nullptr);
+    sendNextPhase();
+
+    // The classifier's command buffer, exactly as long as a hand-back may be.
+    std::vector<U8> command(HDR_CMD_LEN, 0);
+    command[0] = 0x1B;
+    command[1] = 'w';
+    active = true;
+    const S32 r = MAA_Hook(static_cast<U32>(fdPrn.load()), command.data());
+    active = false;
+    const std::vector<uint8_t> wire = vdev::HostRead(vdev::kPrn);
+
+    CHECK(r >= -1 && r <= static_cast<S32>(HDR_CMD_LEN - 2), "MAA_Hook returned out of range");
+    const bool started = beforeEmpty.compare(0, kStart.size(), kStart) == 0;
+    if (r != 0) {
+        // Not a session: the bytes taken go back unchanged, and nothing is written.
+        CHECK(!started, "the start command was not taken");
+        CHECK(wire.empty(), "the device answered what was not a start command");
+        CHECK(r == -1 || (std::memcmp(command.data(), "\x1bw", 2) == 0 &&
+                          host.compare(0, static_cast<size_t>(r), reinterpret_cast<const char *>(command.data()) + 2,
+                                       static_cast<size_t>(r)) == 0),
+              "the bytes handed back are not the host's");
+    } else if (started) {
+        CHECK(startsWith(wire, kOk), "the start was not acknowledged");
+        // Only the stop or the cable ends a session: the stop is acknowledged.
+        if (!pulled) {
+            CHECK(host.find("MAA-STOP") != std::string::npos, "the session ended without a stop or a pull");
+            // Behind the start's answer; an auto run may write after it.
+            const std::string_view w(reinterpret_cast<const char *>(wire.data()), wire.size());
+            CHECK(w.find(kOk, kOk.size()) != std::string_view::npos, "the stop was not acknowledged");
+        }
+        // (Variables the lines defined keep their cells: they are the symbol table's.)
+        U32 left = 0;
+        CHECK(MAA_DownloadTotal() == 0 && MAA_DownloadBuffer(&left) == nullptr, "downloads outlive their session");
+    }
+    IsDisconnected = 0;
+    phases.clear();
+}
+
+}  // namespace
+
+// The shell's poll wait, seen by the host first.
+extern "C" int __real__Z11Wait_PollIniiPsPFbvE(int fd, int timeoutMs, short *revents, WaitGoneFn gone);
+extern "C" int __wrap__Z11Wait_PollIniiPsPFbvE(int fd, int timeoutMs, short *revents, WaitGoneFn gone) {
+    onPoll();
+    return __real__Z11Wait_PollIniiPsPFbvE(fd, timeoutMs, revents, gone);
+}
+
+extern "C" int LLVMFuzzerInitialize(int *, char ***) {
+    setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
+    static TempRoot root;
+    if (FILE *f = std::fopen((root / "/t").c_str(), "w")) {
+        std::fputs("first line\nsecond line\n\nafter the empty line\n", f);
+        std::fclose(f);
+    }
+    return 0;
+}
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
+    registerSymbols();
+    fSellStop = 0;
+    ulReadCount = 0;
+    dataReadCount = 0;
+
+    // Sessions between cable pulls.
+    const std::string_view all(reinterpret_cast<const char *>(data), size);
+    for (size_t from = 0; from <= all.size();) {
+        size_t cut = from;
+        while (cut + 1 < all.size() && !(static_cast<U8>(all[cut]) == 0xFE && static_cast<U8>(all[cut + 1]) == 0xFD))
+            ++cut;
+        if (cut + 1 >= all.size()) cut = all.size();
+        runSession(all.substr(from, cut - from));
+        from = cut + 2;
+    }
+
+    ::close(fdPrn);
+    fdPrn = 0;
+    IsDisconnected = 0;
+    MAA_HeapFree(stCmdHeap.ulHeapPtr, 0);
+    stCmdHeap = {};
+    MAA_HeapFree(stDataHeap.ulHeapPtr, 0);
+    stDataHeap = {};
+    MAA_DownloadFreeAll();
+    MAA_SetResultWriter(nullptr);
+    MAA_SymbolClear();
+    MAA_AddrReset();
+    return 0;
+}

@@ -1,0 +1,417 @@
+// The operator-panel tests against a UI server whose every move the input
+// chooses: the answers it sends (garbage, short, long, in pieces), whether it
+// closes or holds the connection, refuses it, or (for the two listening tests)
+// finds the port taken. The server is a thread of this process on loopback; the
+// panel's port comes from USBADAPTER_UI_PORT.
+//
+// Input: byte 0 the test function, byte 1 flags (bit 0: nobody at the port,
+// bit 1: the cable is pulled during the call), bytes 2-5 the host's argument
+// (little-endian), then the server's script, one step per byte (mod 5):
+//   0 n b...  send the n bytes behind (one write)
+//   1 b k     send (k + 1) * 64 bytes of b (one write)
+//   2         pause 0.2 ms (the next send is likely a read of its own)
+//   3         close (the server's writing end; it then waits for the test to close)
+//   4         hold: send nothing more and wait for the test to close
+// A script that runs out closes. Every input checks: the records the host gets
+// are well-formed (one header, then at most one verdict), no connection is left
+// open, no descriptor is left behind, a server that answers gets a verdict, and
+// a listening test acknowledges exactly the answer it passes.
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <condition_variable>
+#include <cstddef>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "adapter/USB.h"
+#include "maa/MAA_IF.h"
+#include "maa/MAA_Result.h"
+#include "maa/functions/MAA_Panel.h"
+#include "support/TempRoot.h"
+
+namespace {
+
+[[noreturn]] void fail(const char *what) {
+    std::fprintf(stderr, "\n== fuzz_ui_answers: %s\n", what);
+    std::abort();
+}
+#define CHECK(cond, what)        \
+    do {                         \
+        if (!(cond)) fail(what); \
+    } while (0)
+
+constexpr int kLongWaitMs = 3000;  // the panel's waits when an answer is due
+constexpr int kShortWaitMs = 1;    // when the server holds: the wait itself is the outcome
+constexpr int kPeerWaitMs = 3000;  // any one step of the server thread
+
+// ---- the panel tests -----------------------------------------------------------
+
+enum class Kind { Client, KeySound, Listening };
+struct Fn {
+    Kind kind;
+    TMAAResult *(*call)(U32);
+    char command;  // the listening tests' command byte
+};
+
+template <TMAAResult *(*F)()>
+TMAAResult *noArg(U32) {
+    return F();
+}
+
+const Fn kFns[] = {
+    {Kind::Client, UISSM_IF_KeyInTest_And_Cli, 0},
+    {Kind::Client, UISSM_IF_LED_Test_And_Cli, 0},
+    {Kind::Client, noArg<UISSM_IF_Key_WaitTest_And_Cli>, 0},
+    {Kind::Client, noArg<UISSM_IF_Key_LCD_Test_And_Cli>, 0},
+    {Kind::Client, noArg<UISSM_MAA_CountrySkip_And_Cli>, 0},
+    {Kind::Client, noArg<UISSM_MAA_TrayConfirmSkip_And_Cli>, 0},
+    {Kind::Client, SPI_Set_UI_Power_Save_And_Cli, 0},
+    {Kind::Client, UISSM_MAA_TSPCalibration_Result_And_Cli, 0},
+    {Kind::Client, noArg<PbaMode_UI_Data_clear>, 0},
+    {Kind::Client, noArg<SPI_Get_UI>, 0},
+    {Kind::Client, noArg<SPI_Set_UI_Reboot>, 0},
+    {Kind::KeySound, UISSM_MAA_Set_KeySound_And_Cli, 0},
+    {Kind::Client, noArg<UISSM_MAA_MIC_Test_And_Cli>, 0},
+    {Kind::Client, UISSM_MAA_HAPTIC_And_Cli, 0},
+    {Kind::Client, UISSM_MAA_SpeakerTest_And_Cli, 0},
+    {Kind::Client, noArg<UISSM_MAA_USB_Test_And_Cli>, 0},
+    {Kind::Listening, noArg<UISSM_IF_KeyInTest>, '1'},
+    {Kind::Listening, noArg<UISSM_IF_LED_Test>, '2'},
+};
+constexpr size_t kFnCount = sizeof kFns / sizeof kFns[0];
+
+struct Record {
+    U32 status;
+    std::string text;
+};
+Record recordOf(const TMAAResult *r) {
+    return {r->enContinue,
+            std::string(reinterpret_cast<const char *>(r->pubData), r->pubData != nullptr ? r->ulDataSize : 0)};
+}
+std::vector<Record> written;
+void capture(const TMAAResult *r) { written.push_back(recordOf(r)); }
+
+// ---- the server's script ----------------------------------------------------------
+
+struct Step {
+    enum Op { Send, Pause, Close, Hold } op;
+    std::string bytes;
+};
+struct Script {
+    std::vector<Step> steps;
+    bool holds = false;    // ends holding the connection open
+    bool answers = false;  // sends at least one byte
+};
+
+Script parseScript(const uint8_t *d, size_t n) {
+    Script s;
+    for (size_t i = 0; i < n && !s.holds;) {
+        const int op = d[i++] % 5;
+        if (op == 0) {
+            const size_t len = i < n ? d[i++] : 0;
+            const size_t take = std::min(len, n - i);
+            if (take > 0) s.steps.push_back({Step::Send, std::string(reinterpret_cast<const char *>(d + i), take)});
+            i += take;
+        } else if (op == 1) {
+            const char b = i < n ? static_cast<char>(d[i++]) : 'x';
+            const size_t k = i < n ? d[i++] : 0;
+            s.steps.push_back({Step::Send, std::string((k + 1) * 64, b)});
+        } else if (op == 2) {
+            s.steps.push_back({Step::Pause, {}});
+        } else if (op == 3) {
+            s.steps.push_back({Step::Close, {}});
+            break;
+        } else {
+            s.steps.push_back({Step::Hold, {}});
+            s.holds = true;
+        }
+    }
+    for (const Step &st : s.steps) s.answers = s.answers || st.op == Step::Send;
+    return s;
+}
+
+// ---- the server thread --------------------------------------------------------------
+
+int64_t nowMs() {
+    return std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now().time_since_epoch())
+        .count();
+}
+
+uint16_t serverPort, listenPort, deadPort;
+int listenFd = -1, deadFd = -1;
+int wakePipe[2] = {-1, -1};  // readable once the call under test has returned
+
+struct Job {
+    bool peer = false;  // connect to a listening test instead of accepting
+    Script script;
+};
+struct Outcome {
+    bool connected = false;
+    bool closedByTest = false;  // the test's end was seen closed
+    std::string request;        // what arrived before the first answer
+    std::string after;          // what arrived after it
+};
+
+// Never destroyed: the server thread waits on them until the process ends.
+std::mutex &mu = *new std::mutex;
+std::condition_variable &cv = *new std::condition_variable;
+bool jobPosted = false, jobDone = false;
+Job job;
+Outcome outcome;
+
+// 1: readable within the bound; 0: not, or the call has returned and nothing is there.
+int waitIn(int fd, int timeoutMs) {
+    const int64_t deadline = nowMs() + timeoutMs;
+    for (;;) {
+        const int64_t left = deadline - nowMs();
+        pollfd p[2] = {{fd, POLLIN, 0}, {wakePipe[0], POLLIN, 0}};
+        const int rc = ::poll(p, 2, static_cast<int>(std::max<int64_t>(left, 0)));
+        if (rc < 0 && errno == EINTR) continue;
+        if (rc <= 0) return 0;
+        if (p[0].revents != 0) return 1;
+        // The call is over: whatever it left is already here.
+        pollfd q{fd, POLLIN, 0};
+        return ::poll(&q, 1, 0) > 0 ? 1 : 0;
+    }
+}
+
+// Appends one read; false when the other end closed or failed.
+bool readSome(int fd, std::string &into) {
+    char buf[2048];
+    ssize_t n;
+    do {
+        n = ::recv(fd, buf, sizeof buf, 0);
+    } while (n < 0 && errno == EINTR);
+    if (n <= 0) return false;
+    into.append(buf, static_cast<size_t>(n));
+    return true;
+}
+
+void sendAll(int fd, const std::string &bytes) {
+    for (size_t done = 0; done < bytes.size();) {
+        const ssize_t n = ::send(fd, bytes.data() + done, bytes.size() - done, MSG_NOSIGNAL);
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) return;
+        done += static_cast<size_t>(n);
+    }
+}
+
+// Connects to a listening test, retrying until it listens or has returned.
+int connectPeer() {
+    sockaddr_in sa{};
+    sa.sin_family = AF_INET;
+    sa.sin_port = htons(listenPort);
+    sa.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    for (const int64_t deadline = nowMs() + kPeerWaitMs; nowMs() < deadline;) {
+        const int fd = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        if (fd < 0) return -1;
+        if (::connect(fd, reinterpret_cast<sockaddr *>(&sa), sizeof sa) == 0) return fd;
+        ::close(fd);
+        pollfd p{wakePipe[0], POLLIN, 0};
+        if (::poll(&p, 1, 0) > 0) return -1;
+        std::this_thread::sleep_for(std::chrono::microseconds(100));
+    }
+    return -1;
+}
+
+void serve(const Job &j, Outcome &o) {
+    int fd = -1;
+    if (j.peer) {
+        fd = connectPeer();
+    } else if (waitIn(listenFd, kPeerWaitMs) == 1) {
+        fd = ::accept4(listenFd, nullptr, nullptr, SOCK_CLOEXEC);
+    }
+    if (fd < 0) return;
+    o.connected = true;
+    // The request: a client test's one or two bytes, a listening test's command.
+    if (waitIn(fd, kPeerWaitMs) == 1) readSome(fd, o.request);
+    bool sent = false;
+    for (const Step &st : j.script.steps) {
+        if (st.op == Step::Send) {
+            sendAll(fd, st.bytes);
+            sent = true;
+        } else if (st.op == Step::Pause) {
+            std::this_thread::sleep_for(std::chrono::microseconds(200));
+        } else {
+            break;
+        }
+    }
+    if (!j.script.holds) ::shutdown(fd, SHUT_WR);
+    // Until the test closes its end: it must, once the call has returned.
+    const int64_t deadline = nowMs() + kPeerWaitMs;
+    for (;;) {
+        pollfd p{fd, POLLIN, 0};
+        const int64_t left = deadline - nowMs();
+        if (left <= 0 || ::poll(&p, 1, static_cast<int>(left)) <= 0) break;
+        std::string got;
+        if (!readSome(fd, got)) {
+            o.closedByTest = true;
+            break;
+        }
+        (sent ? o.after : o.request) += got;
+    }
+    ::close(fd);
+}
+
+void serverThread() {
+    for (;;) {
+        Job j;
+        {
+            std::unique_lock lk(mu);
+            cv.wait(lk, [] { return jobPosted; });
+            jobPosted = false;
+            j = job;
+        }
+        Outcome o;
+        serve(j, o);
+        std::lock_guard lk(mu);
+        outcome = std::move(o);
+        jobDone = true;
+        cv.notify_all();
+    }
+}
+
+uint16_t boundPort(int fd) {
+    sockaddr_in sa{};
+    socklen_t len = sizeof sa;
+    return ::getsockname(fd, reinterpret_cast<sockaddr *>(&sa), &len) == 0 ? ntohs(sa.sin_port) : 0;
+}
+
+// A loopback socket on a free port: listening, or only bound (connections refused).
+int loopbackSocket(bool listening) {
+    const int fd = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_in sa{};
+    sa.sin_family = AF_INET;
+    sa.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    if (fd < 0 || ::bind(fd, reinterpret_cast<sockaddr *>(&sa), sizeof sa) != 0 ||
+        (listening && ::listen(fd, 8) != 0)) {
+        fail("no loopback socket");
+    }
+    return fd;
+}
+
+int lowestFreeFd() {
+    const int fd = ::dup(0);
+    ::close(fd);
+    return fd;
+}
+
+bool startsWith(const std::string &s, const char *prefix) { return s.rfind(prefix, 0) == 0; }
+
+}  // namespace
+
+extern "C" int LLVMFuzzerInitialize(int *, char ***) {
+    setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
+    // The UI server's address file names loopback, so nothing else is ever reached.
+    static TempRoot root;
+    std::filesystem::create_directories(root / "/root/Halvard/osgi");
+    std::ofstream(root / "/root/Halvard/osgi/socketAddress.prop") << "127.0.0.1";
+    listenFd = loopbackSocket(true);
+    deadFd = loopbackSocket(false);
+    serverPort = boundPort(listenFd);
+    deadPort = boundPort(deadFd);
+    // For the listening tests: free now, and only they bind it.
+    const int probe = loopbackSocket(false);
+    listenPort = boundPort(probe);
+    ::close(probe);
+    if (::pipe2(wakePipe, O_CLOEXEC) != 0) fail("no pipe");
+    MAA_SetResultWriter(&capture);
+    std::thread(serverThread).detach();
+    return 0;
+}
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
+    if (size < 6) return 0;
+    const Fn &fn = kFns[data[0] % kFnCount];
+    const bool nobody = data[1] & 1;
+    const bool pulled = data[1] & 2;
+    U32 arg = 0;
+    std::memcpy(&arg, data + 2, 4);
+    const Script script = parseScript(data + 6, size - 6);
+    const bool listening = fn.kind == Kind::Listening;
+
+    // Nobody: the client tests find the port refusing, the listening tests
+    // find it taken (by the server's own listener).
+    const uint16_t port = listening ? (nobody ? serverPort : listenPort) : (nobody ? deadPort : serverPort);
+    setenv("USBADAPTER_UI_PORT", std::to_string(port).c_str(), 1);
+    // Only a wait that is itself the outcome is short; one that an answer ends is long.
+    MAA_PanelSetWaits(kLongWaitMs, kLongWaitMs, script.holds ? kShortWaitMs : kLongWaitMs);
+
+    const int fdBefore = lowestFreeFd();
+    if (!nobody) {
+        std::lock_guard lk(mu);
+        job = {listening, script};
+        jobPosted = true;
+        jobDone = false;
+        cv.notify_all();
+    }
+    IsDisconnected = pulled ? 1 : 0;
+    written.clear();
+    stMAASysResult = {};
+    TMAAResult *r = fn.call(arg);
+    IsDisconnected = 0;
+    Outcome o;
+    if (!nobody) {
+        char c = 'r';
+        if (::write(wakePipe[1], &c, 1) != 1) fail("wake pipe");
+        std::unique_lock lk(mu);
+        if (!cv.wait_for(lk, std::chrono::milliseconds(3 * kPeerWaitMs), [] { return jobDone; }))
+            fail("the server thread did not finish (hang)");
+        o = outcome;
+        lk.unlock();
+        while (::read(wakePipe[0], &c, 1) != 1) {
+        }
+    }
+
+    // Records: the header, written at once; then the returned record: the
+    // header again (no verdict) or the verdict, which ends the test.
+    CHECK(r == &stMAASysResult, "the record returned is not the shell's result record");
+    CHECK(written.size() == 1, "not exactly one record written during the call");
+    const Record &header = written[0];
+    CHECK(header.status == MAA_RESULT_CONTINUE && startsWith(header.text, "[ ") && header.text.back() == ']',
+          "the first record is not the test's header");
+    const Record last = recordOf(r);
+    const bool verdict = last.status == MAA_RESULT_END;
+    CHECK(verdict || (last.status == MAA_RESULT_CONTINUE && last.text == header.text),
+          "no verdict, yet the header was replaced");
+    CHECK(!verdict || (!last.text.empty() && last.text.find('\0') == std::string::npos), "an empty or binary verdict");
+
+    // Nothing left open: the test closed its end, and no descriptor remains.
+    if (o.connected) CHECK(o.closedByTest, "the connection was left open");
+    CHECK(lowestFreeFd() == fdBefore, "a descriptor was left open");
+
+    if (!listening && o.connected && !pulled) {
+        CHECK(!o.request.empty() && o.request.size() <= 2, "a request of neither one nor two bytes");
+        // An answered test gives its verdict, unless the key sound test was
+        // asked for neither on nor off.
+        const bool keySoundSilent = fn.kind == Kind::KeySound && arg > 1;
+        if (!script.holds && script.answers && !keySoundSilent) CHECK(verdict, "answered, yet no verdict");
+    }
+    if (listening && o.connected && !pulled) {
+        // The command first; an acknowledgement exactly when the test passed,
+        // which takes an answer that holds the command byte.
+        CHECK(!o.request.empty() && o.request[0] == fn.command, "the listening test sent no command");
+        CHECK(verdict == startsWith(o.after, "3"), "a pass and its acknowledgement disagree");
+        bool echoable = false;
+        for (const Step &st : script.steps)
+            echoable = echoable || (st.op == Step::Send && st.bytes.find(fn.command) != std::string::npos);
+        if (!echoable) CHECK(!verdict, "a pass without the command's answer");
+    }
+    return 0;
+}
