@@ -149,6 +149,7 @@ const std::string_view kOk("\x1bwMAA-OK", 8);
 void openNode() {
     if (fdPrn > 0) ::close(fdPrn);
     vdev::Reset();
+    Wait_PutBack(-1, nullptr, 0, false);
     fdPrn = ::open(vdev::kPrn, O_RDWR);
     CHECK(fdPrn > 0, "the print node does not open");
     vdev::SetInstantTimeouts(vdev::kPrn, true);
@@ -217,11 +218,12 @@ void runSession(std::string_view traffic) {
 
 }  // namespace
 
-// The shell's poll wait, seen by the host first.
-extern "C" int __real__Z11Wait_PollIniiPsPFbvE(int fd, int timeoutMs, short *revents, WaitGoneFn gone);
-extern "C" int __wrap__Z11Wait_PollIniiPsPFbvE(int fd, int timeoutMs, short *revents, WaitGoneFn gone) {
-    onPoll();
-    return __real__Z11Wait_PollIniiPsPFbvE(fd, timeoutMs, revents, gone);
+// The shell's poll wait, seen by the host first (a poll that bytes put back
+// in front of the node answer at once is no wait).
+extern "C" int __real__Z11Wait_PollIniiPsPFbvEi(int fd, int timeoutMs, short *revents, WaitGoneFn gone, int wakeFd);
+extern "C" int __wrap__Z11Wait_PollIniiPsPFbvEi(int fd, int timeoutMs, short *revents, WaitGoneFn gone, int wakeFd) {
+    if (Wait_PutBackLeft(fd) == 0) onPoll();
+    return __real__Z11Wait_PollIniiPsPFbvEi(fd, timeoutMs, revents, gone, wakeFd);
 }
 
 extern "C" int LLVMFuzzerInitialize(int *, char ***) {
