@@ -6,7 +6,9 @@
 #include <cstring>
 
 #include "maa/MAA_Address.h"
+#include "maa/MAA_Hook.h"
 #include "maa/MAA_IF.h"
+#include "maa/MAA_MM.h"
 #include "maa/MAA_Symbol.h"
 
 namespace probes {
@@ -64,6 +66,19 @@ inline void Register(void (*extra)() = nullptr) {
     MAA_SymbolAdd(ftarget_ppc, "y", MAA_SYM_DATA, MAA_AddrMap(&ulY, 4), 0);
     MAA_SymbolAdd(ftarget_ppc, "u", MAA_SYM_UNDEF, 0x7FFFFFF0, 0);
     MAA_SymbolAddGeneral(ftarget_ppc, "MAA_GENERAL_FUNCTION", MAA_SYM_FUNC_HIDE, MAA_AddrGeneralHandle(&general), 2);
+}
+
+// The shell's state between inputs: what sessions held is freed (libFuzzer's
+// leak check compares inputs) and the next input starts afresh.
+inline void ForgetShell() {
+    for (MAAHeapHandle *h : {&stCmdHeap, &stDataHeap}) {
+        MAA_HeapFree(h->ulHeapPtr, 0);
+        *h = {};
+    }
+    MAA_DownloadFreeAll();
+    MAA_SetResultWriter(nullptr);
+    MAA_SymbolClear();
+    MAA_AddrReset();
 }
 
 }  // namespace probes

@@ -256,13 +256,6 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     ::close(fdPrn);
     fdPrn = 0;
     IsDisconnected = 0;
-    MAA_HeapFree(stCmdHeap.ulHeapPtr, 0);
-    stCmdHeap = {};
-    MAA_HeapFree(stDataHeap.ulHeapPtr, 0);
-    stDataHeap = {};
-    MAA_DownloadFreeAll();
-    MAA_SetResultWriter(nullptr);
-    MAA_SymbolClear();
-    MAA_AddrReset();
+    probes::ForgetShell();
     return 0;
 }

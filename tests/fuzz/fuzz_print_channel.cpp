@@ -282,14 +282,7 @@ void cleanUp() {
     vdev::Reset();
     IsDisconnected = 0;
     hibernation_flag = 0;
-    MAA_HeapFree(stCmdHeap.ulHeapPtr, 0);
-    stCmdHeap = {};
-    MAA_HeapFree(stDataHeap.ulHeapPtr, 0);
-    stDataHeap = {};
-    MAA_DownloadFreeAll();
-    MAA_SetResultWriter(nullptr);
-    MAA_SymbolClear();
-    MAA_AddrReset();
+    probes::ForgetShell();
     java = Java{};
     std::lock_guard lk(hostMu);
     phases = {};
