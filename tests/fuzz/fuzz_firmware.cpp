@@ -27,16 +27,12 @@
 #include <thread>
 #include <vector>
 
+#include "FuzzCheck.h"
 #include "firmware/FirmWareUpdate.h"
 #include "firmware/UpdateManager.h"
 #include "vdev.h"
 
 namespace {
-
-[[noreturn]] void fail(const char *what) {
-    std::fprintf(stderr, "\n== fuzz_firmware: %s\n", what);
-    std::abort();
-}
 
 std::vector<std::string> Split(std::string_view s, std::string_view sep) {
     std::vector<std::string> out;

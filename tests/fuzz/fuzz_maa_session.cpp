@@ -29,6 +29,7 @@
 #include <string_view>
 #include <vector>
 
+#include "FuzzCheck.h"
 #include "adapter/USB.h"
 #include "common/Wait.h"
 #include "maa/MAA_Address.h"
@@ -42,15 +43,6 @@
 #include "vdev.h"
 
 namespace {
-
-[[noreturn]] void fail(const char *what) {
-    std::fprintf(stderr, "\n== fuzz_maa_session: %s\n", what);
-    std::abort();
-}
-#define CHECK(cond, what)        \
-    do {                         \
-        if (!(cond)) fail(what); \
-    } while (0)
 
 // Polls in a row with nothing to read before the host counts the device as
 // waiting, and polls after a pull before the session counts as hung.

@@ -37,6 +37,7 @@
 #include <thread>
 #include <vector>
 
+#include "FuzzCheck.h"
 #include "adapter/Classifier.h"
 #include "adapter/USB.h"
 #include "adapter/prn_thread.h"
@@ -62,15 +63,6 @@ constexpr auto kHangAfterPull = std::chrono::seconds(1);
 // waiting for the host. Only the retry loops get there.
 constexpr size_t kIdleCalls = 64;
 constexpr size_t kControllerAllocLimit = size_t{256} << 20;
-
-[[noreturn]] void fail(const char *what) {
-    std::fprintf(stderr, "\n== fuzz_print_channel: %s\n", what);
-    std::abort();
-}
-#define CHECK(cond, what)        \
-    do {                         \
-        if (!(cond)) fail(what); \
-    } while (0)
 
 // ---- Java's side ----------------------------------------------------------
 

@@ -21,6 +21,7 @@
 #include <string_view>
 #include <vector>
 
+#include "FuzzCheck.h"
 #include "adapter/USB.h"
 #include "common/ByteOrder.h"
 #include "print/USBPrint.h"
@@ -32,15 +33,6 @@
 namespace {
 
 constexpr size_t kTurnLimit = 100000;
-
-[[noreturn]] void fail(const char *what) {
-    std::fprintf(stderr, "\n== fuzz_scan_channel: %s\n", what);
-    std::abort();
-}
-#define CHECK(cond, what)        \
-    do {                         \
-        if (!(cond)) fail(what); \
-    } while (0)
 
 struct Java {
     U8 failAt = 0;       // which call of a transfer answers -1

@@ -39,6 +39,7 @@
 #include <thread>
 #include <vector>
 
+#include "FuzzCheck.h"
 #include "adapter/USB.h"
 #include "maa/MAA_IF.h"
 #include "maa/MAA_Result.h"
@@ -46,15 +47,6 @@
 #include "support/TempRoot.h"
 
 namespace {
-
-[[noreturn]] void fail(const char *what) {
-    std::fprintf(stderr, "\n== fuzz_ui_answers: %s\n", what);
-    std::abort();
-}
-#define CHECK(cond, what)        \
-    do {                         \
-        if (!(cond)) fail(what); \
-    } while (0)
 
 constexpr int kLongWaitMs = 3000;  // the panel's waits when an answer is due
 constexpr int kShortWaitMs = 1;    // when the server holds: the wait itself is the outcome
