@@ -188,7 +188,11 @@ TEST_F(FirmwareTest, ManagerAnswersDecideTheOutcome) {
     }
 }
 
+// A manager that sends reports below 100 for ever is heard all along (each
+// report is within the receive wait); only the bound on the whole progress
+// phase, shortened here, ends it. The others fail or pass well inside it.
 TEST_F(FirmwareTest, MisbehavingManagerFailsTheDownloadWithinItsTimeOuts) {
+    UpdateManager_SetProgressLimitMs(600);
     struct Row {
         UmMisbehaviour m;
         S32 result;
@@ -198,7 +202,8 @@ TEST_F(FirmwareTest, MisbehavingManagerFailsTheDownloadWithinItsTimeOuts) {
         {UmMisbehaviour::ProgressFail, -1, "Download of FirmWare Failed\r\n"},
         {UmMisbehaviour::Silence, -1, "PROGRESS not received\r\n"},
         {UmMisbehaviour::EarlyClose, -1, "PROGRESS not received\r\n"},
-        {UmMisbehaviour::SlowProgress, 0, "FirmWare Update Done....Rebooting\r\n"},
+        {UmMisbehaviour::SlowProgress, 0, "FirmWare Update Done....Rebooting\r\n"},  // 4 pairs, 50 ms apart
+        {UmMisbehaviour::EndlessProgress, -1, "PROGRESS not done within 0 s\r\n"},
     };
     for (const Row &r : rows) {
         SCOPED_TRACE(peers::UmMisbehaviourName(r.m));
@@ -206,44 +211,16 @@ TEST_F(FirmwareTest, MisbehavingManagerFailsTheDownloadWithinItsTimeOuts) {
         StartManager(r.m);
         auto t0 = std::chrono::steady_clock::now();
         QuietStdout quiet;
-        Outcome o = DownloadImages({{"E2", RandomBytes(3000, 8)}});
-        EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(3));
+        Outcome o = DownloadImages({{"E7", RandomBytes(3000, 8)}});
+        const auto took = std::chrono::steady_clock::now() - t0;
+        EXPECT_LT(took, std::chrono::seconds(3));
         EXPECT_EQ(o.result, r.result);
         EXPECT_EQ(LoggerHost_Count(r.line), 1);
-        manager_.Stop();
-    }
-}
-
-// Reports below 100 that keep coming are each within the receive wait; only
-// the bound on the whole progress phase ends them. A slow manager that does
-// finish inside the bound is not cut.
-TEST_F(FirmwareTest, ProgressThatNeverReachesItsEndIsCapped) {
-    UpdateManager_SetProgressLimitMs(600);
-    struct Row {
-        UmMisbehaviour m;
-        S32 result;
-        int capped;  // "PROGRESS not done within 0 s" lines
-    } rows[] = {
-        {UmMisbehaviour::EndlessProgress, -1, 1},
-        {UmMisbehaviour::SlowProgress, 0, 0},  // 4 pairs, 50 ms apart
-    };
-    for (const Row &r : rows) {
-        SCOPED_TRACE(peers::UmMisbehaviourName(r.m));
-        LoggerHost_StartCapture();
-        StartManager(r.m);
-        auto t0 = std::chrono::steady_clock::now();
-        QuietStdout quiet;
-        Outcome o = DownloadImages({{"E7", RandomBytes(2000, 15)}});
-        const auto took = std::chrono::steady_clock::now() - t0;
-        EXPECT_EQ(o.result, r.result);
-        EXPECT_EQ(LoggerHost_Count("PROGRESS not done within 0 s\r\n"), r.capped);
-        EXPECT_EQ(LoggerHost_Count("timeout!!!\n"), 0);
-        if (r.capped) {
+        if (r.m == UmMisbehaviour::EndlessProgress) {
             EXPECT_GE(took, std::chrono::milliseconds(600));
-            EXPECT_LT(took, std::chrono::seconds(3));
-            // The manager was heard all along, and is let go.
+            EXPECT_EQ(LoggerHost_Count("timeout!!!\n"), 0);
             EXPECT_GE(LoggerHost_Count("fw type SCAN\tProgress 1%\r\n"), 1);
-            EXPECT_TRUE(manager_.WaitFor([&] { return manager_.Active() == 0; }, 3000));
+            EXPECT_TRUE(manager_.WaitFor([&] { return manager_.Active() == 0; }, 3000)) << "the manager is let go";
         }
         manager_.Stop();
     }
