@@ -44,6 +44,7 @@
 #include "maa/MAA_IF.h"
 #include "maa/MAA_Result.h"
 #include "maa/functions/MAA_Panel.h"
+#include "UiPeer.h"
 #include "support/TempRoot.h"
 
 namespace {
@@ -183,27 +184,6 @@ int waitIn(int fd, int timeoutMs) {
     }
 }
 
-// Appends one read; false when the other end closed or failed.
-bool readSome(int fd, std::string &into) {
-    char buf[2048];
-    ssize_t n;
-    do {
-        n = ::recv(fd, buf, sizeof buf, 0);
-    } while (n < 0 && errno == EINTR);
-    if (n <= 0) return false;
-    into.append(buf, static_cast<size_t>(n));
-    return true;
-}
-
-void sendAll(int fd, const std::string &bytes) {
-    for (size_t done = 0; done < bytes.size();) {
-        const ssize_t n = ::send(fd, bytes.data() + done, bytes.size() - done, MSG_NOSIGNAL);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) return;
-        done += static_cast<size_t>(n);
-    }
-}
-
 // Connects to a listening test, retrying until it listens or has returned.
 int connectPeer() {
     sockaddr_in sa{};
@@ -232,11 +212,11 @@ void serve(const Job &j, Outcome &o) {
     if (fd < 0) return;
     o.connected = true;
     // The request: a client test's one or two bytes, a listening test's command.
-    if (waitIn(fd, kPeerWaitMs) == 1) readSome(fd, o.request);
+    if (waitIn(fd, kPeerWaitMs) == 1) uipeer::ReadSome(fd, o.request);
     bool sent = false;
     for (const Step &st : j.script.steps) {
         if (st.op == Step::Send) {
-            sendAll(fd, st.bytes);
+            uipeer::SendAll(fd, st.bytes);
             sent = true;
         } else if (st.op == Step::Pause) {
             std::this_thread::sleep_for(std::chrono::microseconds(200));
@@ -252,7 +232,7 @@ void serve(const Job &j, Outcome &o) {
         const int64_t left = deadline - nowMs();
         if (left <= 0 || ::poll(&p, 1, static_cast<int>(left)) <= 0) break;
         std::string got;
-        if (!readSome(fd, got)) {
+        if (!uipeer::ReadSome(fd, got)) {
             o.closedByTest = true;
             break;
         }

@@ -42,8 +42,9 @@ int waitIn(int fd, int stopFd, int timeoutMs) {
     }
 }
 
-// Appends what one read brings; false when the peer closed or failed.
-bool readSome(int fd, std::string &into) {
+}  // namespace
+
+bool ReadSome(int fd, std::string &into) {
     char buf[kBufSize];
     ssize_t n;
     do {
@@ -54,7 +55,7 @@ bool readSome(int fd, std::string &into) {
     return true;
 }
 
-void sendAll(int fd, const std::string &bytes) {
+void SendAll(int fd, const std::string &bytes) {
     size_t done = 0;
     while (done < bytes.size()) {
         const ssize_t n = ::send(fd, bytes.data() + done, bytes.size() - done, MSG_NOSIGNAL);
@@ -63,8 +64,6 @@ void sendAll(int fd, const std::string &bytes) {
         done += static_cast<size_t>(n);
     }
 }
-
-}  // namespace
 
 Responder Scripted(std::vector<Step> steps, Step after) {
     return [steps = std::move(steps), after = std::move(after)](size_t connection, const std::string &) {
@@ -149,13 +148,13 @@ void Server::run() {
 
 void Server::serve(int fd, size_t connection) {
     std::string request;
-    if (waitIn(fd, stopPipe_[0], kWaitMs) == 1 && readSome(fd, request)) {
+    if (waitIn(fd, stopPipe_[0], kWaitMs) == 1 && ReadSome(fd, request)) {
         // A request is one write of one or two bytes; take a straggler too.
-        while (request.size() < 2 && waitIn(fd, stopPipe_[0], 20) == 1 && readSome(fd, request)) {
+        while (request.size() < 2 && waitIn(fd, stopPipe_[0], 20) == 1 && ReadSome(fd, request)) {
         }
     }
     const Step step = responder_(connection, request);
-    if (!step.answer.empty()) sendAll(fd, step.answer);
+    if (!step.answer.empty()) SendAll(fd, step.answer);
     {
         std::lock_guard<std::mutex> lock(mutex_);
         requests_.push_back(request);
@@ -164,7 +163,7 @@ void Server::serve(int fd, size_t connection) {
     if (step.hold) {
         // Until the test closes its end (or the server stops).
         std::string ignored;
-        while (waitIn(fd, stopPipe_[0], 60000) == 1 && readSome(fd, ignored)) {
+        while (waitIn(fd, stopPipe_[0], 60000) == 1 && ReadSome(fd, ignored)) {
         }
     }
 }
@@ -223,7 +222,7 @@ void Client::run(std::string address, uint16_t port) {
     }
     auto take = [&](int timeoutMs) {
         std::string got;
-        const bool open = (timeoutMs == 0 || waitIn(fd, -1, timeoutMs) == 1) && readSome(fd, got);
+        const bool open = (timeoutMs == 0 || waitIn(fd, -1, timeoutMs) == 1) && ReadSome(fd, got);
         std::lock_guard<std::mutex> lock(mutex_);
         received_ += got;
         return open;
@@ -231,7 +230,7 @@ void Client::run(std::string address, uint16_t port) {
     bool open = take(kWaitMs);  // the command
     for (const std::string &answer : answers_) {
         if (!open) break;
-        sendAll(fd, answer);
+        SendAll(fd, answer);
         // Whatever comes back within the pause; the pause also keeps this
         // answer from merging with the next one in a single read.
         const int64_t until = nowMs() + gapMs_;

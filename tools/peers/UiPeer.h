@@ -28,6 +28,11 @@ Responder Scripted(std::vector<Step> steps, Step after = {});
 // Every request answered with `answer` (a UI server that passes every test).
 Responder AnswerAll(std::string answer);
 
+// Appends what one read of the socket brings; false when the peer closed or
+// failed. SendAll sends every byte (resuming after signals) unless it fails.
+bool ReadSome(int fd, std::string &into);
+void SendAll(int fd, const std::string &bytes);
+
 // A free TCP port on 127.0.0.1 at the time of the call.
 uint16_t FreePort();
 
