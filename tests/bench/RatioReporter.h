@@ -62,13 +62,14 @@ public:
     }
 
     void PrintRatios() const {
-        std::printf("\n%-44s %10s %6s %10s %6s %7s\n", "medians of", "rate/1e6", "cv", "baseline", "cv", "ratio");
+        std::printf("\n%-44s %10s %6s %-24s %10s %6s %7s\n", "medians of", "rate/1e6", "cv", "baseline", "", "cv",
+                    "ratio");
         for (const Pair &p : pairs_) {
             auto a = rates_.find(p.name + " " + p.counter), b = rates_.find(p.baseline + " " + p.counter);
             if (a == rates_.end() || b == rates_.end() || b->second.median <= 0) continue;
-            std::printf("%-44s %10.1f %5.1f%% %10.1f %5.1f%% %7.3f\n", (p.name + " " + p.counter).c_str(),
-                        a->second.median / 1e6, a->second.cv * 100, b->second.median / 1e6, b->second.cv * 100,
-                        a->second.median / b->second.median);
+            std::printf("%-44s %10.1f %5.1f%% %-24s %10.1f %5.1f%% %7.3f\n", (p.name + " " + p.counter).c_str(),
+                        a->second.median / 1e6, a->second.cv * 100, p.baseline.c_str(), b->second.median / 1e6,
+                        b->second.cv * 100, a->second.median / b->second.median);
         }
     }
 
