@@ -106,7 +106,7 @@ protected:
 
 class MaaJvmWithoutUpcalls : public MaaJvm {
 protected:
-    const char *Daemon() const override { return fixtures::kDaemonWithoutUpcalls; }
+    const char *Daemon() const override { return jvm::kPrintAndScanService; }
 };
 
 TEST_F(MaaJvm, CpuTemperatureStartAndEndCallTheirJavaMethodsAndReportTheReply) {
@@ -292,7 +292,7 @@ TEST_F(MaaJvm, GeneralFunctionWithoutAReplyLogsItAndEndsWithFailed) {
     // An MAA object without the method.
     auto *maaSlot = hidden::Variable<std::atomic<jobject>>("globalMAAObj");
     ASSERT_NE(maaSlot, nullptr);
-    maaSlot->store(jvm::New(fixtures::kDaemonWithoutUpcalls));
+    maaSlot->store(jvm::New(jvm::kPrintAndScanService));
     Command("Unknown(5)", "Unknown");
     EXPECT_EQ(Seen(sh.General(1, args)), (Recs{End("Failed")}));
     EXPECT_EQ(LoggerHost_Count("[MAA] can't find runUsbFunctionCall()\n"), 1);

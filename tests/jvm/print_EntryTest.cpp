@@ -21,13 +21,8 @@ struct Tracked {
 };
 
 Tracked Make(const char *cls) {
-    JNIEnv *env = jvm::Env();
-    jclass c = jvm::Class(cls);
-    jmethodID init = env->GetMethodID(c, "<init>", "()V");
-    jobject local = env->NewObject(c, init);
-    Tracked t{env->NewGlobalRef(local), env->NewWeakGlobalRef(local)};
-    env->DeleteLocalRef(local);
-    return t;
+    jobject global = jvm::New(cls);
+    return {global, jvm::Env()->NewWeakGlobalRef(global)};
 }
 
 void Drop(Tracked &t) {
@@ -59,7 +54,7 @@ TEST_F(PrintEntry, MissingStringReleasesTheDaemonAndReturns) {
     };
     for (const auto &r : rows) {
         SCOPED_TRACE(r.named);
-        Tracked daemon = Make(fixtures::kRecordingDaemon), maa = Make(fixtures::kRecordingMaa);
+        Tracked daemon = Make(fixtures::kRecordingDaemon), maa = Make(fixtures::kRecordingDaemon);
         jvm::RunOnThread(
             [&](JNIEnv *env) { ReadPrintMsg(env, daemon.global, maa.global, r.manufacturer, r.model, r.deviceClass); },
             "print-entry");
@@ -79,7 +74,7 @@ TEST_F(PrintEntry, MissingStringReleasesTheDaemonAndReturns) {
 }
 
 TEST_F(PrintEntry, CallAfterAFailedOneReleasesItsMaaObjectAndStartsTheReader) {
-    Tracked daemon1 = Make(fixtures::kRecordingDaemon), maa1 = Make(fixtures::kRecordingMaa);
+    Tracked daemon1 = Make(fixtures::kRecordingDaemon), maa1 = Make(fixtures::kRecordingDaemon);
     CreateQueues(daemon1.global);
     if (HasFatalFailure()) return;
     jvm::RunOnThread(
@@ -88,7 +83,7 @@ TEST_F(PrintEntry, CallAfterAFailedOneReleasesItsMaaObjectAndStartsTheReader) {
     Drop(maa1);
     LoggerHost_StartCapture();
 
-    Tracked daemon2 = Make(fixtures::kDaemonWithoutUpcalls), maa2 = Make(fixtures::kRecordingMaa);
+    Tracked daemon2 = Make(jvm::kPrintAndScanService), maa2 = Make(fixtures::kRecordingDaemon);
     jobject d2 = daemon2.global, m2 = maa2.global;
     jvm::StartDetached([d2, m2](JNIEnv *env) { ReadPrintMsg(env, d2, m2, "Tarnwel", "TW-4020", "printer"); },
                        "entry-2");
@@ -111,7 +106,7 @@ TEST_F(PrintEntry, CallWhileTheReaderRunsIsRefusedAndTheReaderKeepsItsObjects) {
     LoggerHost_StartCapture();
 
     // Objects without call-backs: a job or query that reached them would fail.
-    jobject daemon2 = jvm::New(fixtures::kDaemonWithoutUpcalls), maa2 = jvm::New(fixtures::kRecordingMaa);
+    jobject daemon2 = jvm::New(jvm::kPrintAndScanService), maa2 = jvm::New(jvm::kPrintAndScanService);
     auto returned = std::make_shared<std::atomic<bool>>(false);
     jvm::StartDetached(
         [daemon2, maa2, returned](JNIEnv *env) {
@@ -135,7 +130,7 @@ TEST_F(PrintEntry, CallWhileTheReaderRunsIsRefusedAndTheReaderKeepsItsObjects) {
     ASSERT_TRUE(fixtures::AwaitJobEnded(0, 10000));
     EXPECT_EQ(fixtures::JobBytes(0), job);
     EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in RegisterJob()::can't find processPrintCommand().\n"), 0);
-    fixtures::SetPrinterStatus(2);
+    fixtures::SetIntReply("getPrinterStatus", 2);
     // The set-up asked once already, for the Device ID.
     const int asked = fixtures::Calls("getPrinterStatus");
     EXPECT_EQ(fetch(), 2u);
