@@ -10,9 +10,7 @@ namespace {
 
 using Local = LocalRef<jobject>;
 
-// A Java string of the calling thread, released at scope end (a temporary lives
-// to the end of the call it is passed to).
-LocalRef<jstring> JStr(const std::string &text) { return {jvm::Env(), jvm::Str(jvm::Env(), text.c_str())}; }
+LocalRef<jstring> JStr(const std::string &text) { return jvm::Str(text.c_str()); }
 
 std::string StaticString(const char *name, const char *sig, jint arg = 0) {
     Local s{jvm::Env(), jvm::CallStaticObject(kJournal, name, sig, arg)};
@@ -47,8 +45,6 @@ bool AwaitCalls(const std::string &method, int count, int timeoutMs) {
 }
 
 int JobCount() { return jvm::CallStaticInt(kJournal, "jobCount", "()I"); }
-
-std::string JobFileName(int job) { return StaticString("jobFileName", "(I)Ljava/lang/String;", job); }
 
 std::string JobBytes(int job) { return StaticBytes("jobBytes", job); }
 
@@ -97,8 +93,8 @@ void SetIntReply(const std::string &method, int reply) {
 }
 
 void SetBytesReply(const std::string &method, const std::string &bytes) {
-    LocalRef<jbyteArray> a{jvm::Env(), jvm::ByteArray(jvm::Env(), bytes)};
-    jvm::CallStaticVoid(kJournal, "setBytesReply", "(Ljava/lang/String;[B)V", JStr(method).get(), a.get());
+    jvm::CallStaticVoid(kJournal, "setBytesReply", "(Ljava/lang/String;[B)V", JStr(method).get(),
+                        jvm::ByteArray(bytes).get());
 }
 
 }  // namespace fixtures

@@ -30,7 +30,6 @@ int Calls(const std::string &method);  // times the call-back was made (also whe
 bool AwaitCalls(const std::string &method, int count, int timeoutMs);
 
 int JobCount();
-std::string JobFileName(int job);         // the name passed to processPrintCommand
 std::string JobBytes(int job);            // all chunks kept, joined
 long long JobByteCount(int job);
 bool JobEnded(int job);                   // fileParsingStatus was set to 1

@@ -56,7 +56,7 @@ TEST_F(PrintEntry, MissingStringReleasesTheDaemonAndReturns) {
         SCOPED_TRACE(r.named);
         Tracked daemon = Make(fixtures::kRecordingDaemon), maa = Make(fixtures::kRecordingDaemon);
         jvm::RunOnThread(
-            [&](JNIEnv *env) { ReadPrintMsg(env, daemon.global, maa.global, r.manufacturer, r.model, r.deviceClass); },
+            [&](JNIEnv *) { ReadPrintMsg(daemon.global, maa.global, r.manufacturer, r.model, r.deviceClass); },
             "print-entry");
         EXPECT_EQ(LoggerHost_Count("[USBAdp] GetStringUTFChars[" + std::string(r.named) + "] returns NULL\n"), 1);
         Drop(daemon);
@@ -78,14 +78,14 @@ TEST_F(PrintEntry, CallAfterAFailedOneReleasesItsMaaObjectAndStartsTheReader) {
     CreateQueues(daemon1.global);
     if (HasFatalFailure()) return;
     jvm::RunOnThread(
-        [&](JNIEnv *env) { ReadPrintMsg(env, daemon1.global, maa1.global, "Tarnwel", "TW-4020", nullptr); },
+        [&](JNIEnv *) { ReadPrintMsg(daemon1.global, maa1.global, "Tarnwel", "TW-4020", nullptr); },
         "entry-1");
     Drop(maa1);
     LoggerHost_StartCapture();
 
     Tracked daemon2 = Make(jvm::kPrintAndScanService), maa2 = Make(fixtures::kRecordingDaemon);
     jobject d2 = daemon2.global, m2 = maa2.global;
-    jvm::StartDetached([d2, m2](JNIEnv *env) { ReadPrintMsg(env, d2, m2, "Tarnwel", "TW-4020", "printer"); },
+    jvm::StartDetached([d2, m2](JNIEnv *) { ReadPrintMsg(d2, m2, "Tarnwel", "TW-4020", "printer"); },
                        "entry-2");
     ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp]Inside USBAdapter_IF_PrintFunction"); }));
     EXPECT_EQ(LoggerHost_Count(kAlreadyRunning), 0);
@@ -109,8 +109,8 @@ TEST_F(PrintEntry, CallWhileTheReaderRunsIsRefusedAndTheReaderKeepsItsObjects) {
     jobject daemon2 = jvm::New(jvm::kPrintAndScanService), maa2 = jvm::New(jvm::kPrintAndScanService);
     auto returned = std::make_shared<std::atomic<bool>>(false);
     jvm::StartDetached(
-        [daemon2, maa2, returned](JNIEnv *env) {
-            ReadPrintMsg(env, daemon2, maa2, "Other", "TW-9999", "printer");
+        [daemon2, maa2, returned](JNIEnv *) {
+            ReadPrintMsg(daemon2, maa2, "Other", "TW-9999", "printer");
             *returned = true;
         },
         "entry-2");

@@ -17,7 +17,6 @@
 #include "Fixtures.h"
 #include "JvmHarness.h"
 #include "LoggerHost.h"
-#include "common/JniUtil.h"
 #include "support/MsgQueue.h"
 #include "support/TempRoot.h"
 #include "support/Uel.h"
@@ -32,11 +31,10 @@ inline constexpr const char *kReadPrintMsgSig =
     "(Ljava/lang/Object;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;I)V";
 
 // Calls readPrintMsg on `daemon` on the calling thread; null texts pass null.
-inline void ReadPrintMsg(JNIEnv *env, jobject daemon, jobject maa, const char *manufacturer, const char *model,
+inline void ReadPrintMsg(jobject daemon, jobject maa, const char *manufacturer, const char *model,
                          const char *deviceClass) {
-    LocalRef<jstring> m{env, jvm::Str(env, manufacturer)}, p{env, jvm::Str(env, model)},
-        c{env, jvm::Str(env, deviceClass)};
-    jvm::CallVoid(daemon, "readPrintMsg", kReadPrintMsgSig, maa, m.get(), p.get(), c.get(), jint{1});
+    jvm::CallVoid(daemon, "readPrintMsg", kReadPrintMsgSig, maa, jvm::Str(manufacturer).get(), jvm::Str(model).get(),
+                  jvm::Str(deviceClass).get(), jint{1});
 }
 
 inline mfp_notif_t Notification(U8 code) {
@@ -108,7 +106,7 @@ protected:
         if (HasFatalFailure()) return;
         jobject daemon = daemon_;
         jvm::StartDetached(
-            [daemon](JNIEnv *e) { printjvm::ReadPrintMsg(e, daemon, daemon, "Tarnwel", "TW-4020 MFP", "printer"); },
+            [daemon](JNIEnv *) { printjvm::ReadPrintMsg(daemon, daemon, "Tarnwel", "TW-4020 MFP", "printer"); },
             "print-reader");
         if (!configure) {
             ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp]Inside USBAdapter_IF_PrintFunction"); }));
@@ -124,8 +122,7 @@ protected:
     // The service queues, made through `service`: a reader that gets in then
     // waits on its queue.
     void CreateQueues(jobject service) {
-        LocalRef<jstring> model{jvm::Env(), jvm::Str(jvm::Env(), "TW-4020 MFP")};
-        jvm::CallVoid(service, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", model.get());
+        jvm::CallVoid(service, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", jvm::Str("TW-4020 MFP").get());
         ASSERT_GE(QueueOf(root_, 5), 0);
     }
 
