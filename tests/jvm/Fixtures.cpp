@@ -10,9 +10,7 @@ namespace {
 
 using Local = LocalRef<jobject>;
 
-// A Java string of the calling thread, released at scope end (a temporary lives
-// to the end of the call it is passed to).
-LocalRef<jstring> JStr(const std::string &text) { return {jvm::Env(), jvm::Str(jvm::Env(), text.c_str())}; }
+LocalRef<jstring> JStr(const std::string &text) { return jvm::Str(text.c_str()); }
 
 std::string StaticString(const char *name, const char *sig, jint arg = 0) {
     Local s{jvm::Env(), jvm::CallStaticObject(kJournal, name, sig, arg)};
@@ -48,23 +46,9 @@ bool AwaitCalls(const std::string &method, int count, int timeoutMs) {
 
 int JobCount() { return jvm::CallStaticInt(kJournal, "jobCount", "()I"); }
 
-std::string JobFileName(int job) { return StaticString("jobFileName", "(I)Ljava/lang/String;", job); }
-
 std::string JobBytes(int job) { return StaticBytes("jobBytes", job); }
 
-std::vector<int> JobChunkSizes(int job) {
-    JNIEnv *env = jvm::Env();
-    Local a{env, jvm::CallStaticObject(kJournal, "jobChunkSizes", "(I)[I", jint{job})};
-    if (!a) return {};
-    auto arr = static_cast<jintArray>(a.get());
-    std::vector<jint> raw(static_cast<size_t>(env->GetArrayLength(arr)));
-    env->GetIntArrayRegion(arr, 0, static_cast<jsize>(raw.size()), raw.data());
-    return {raw.begin(), raw.end()};
-}
-
 long long JobByteCount(int job) { return jvm::CallStaticLong(kJournal, "jobByteCount", "(I)J", jint{job}); }
-
-std::string JobSha256(int job) { return StaticString("jobSha256", "(I)Ljava/lang/String;", job); }
 
 bool JobEnded(int job) { return jvm::CallStaticBoolean(kJournal, "jobEnded", "(I)Z", jint{job}); }
 
@@ -80,16 +64,7 @@ std::string AppBytes(int app) { return StaticBytes("appBytes", app); }
 
 std::string AppThread(int app) { return StaticString("appThread", "(I)Ljava/lang/String;", app); }
 
-int AppWriteCount(int app) { return jvm::CallStaticInt(kJournal, "appWriteCount", "(I)I", jint{app}); }
-
 bool AppClosed(int app) { return jvm::CallStaticBoolean(kJournal, "appClosed", "(I)Z", jint{app}); }
-
-std::string Sha256(const std::string &bytes) {
-    JNIEnv *env = jvm::Env();
-    LocalRef<jbyteArray> a{env, jvm::ByteArray(env, bytes)};
-    Local s{env, jvm::CallStaticObject(kJournal, "sha256", "([B)Ljava/lang/String;", a.get())};
-    return jvm::Text(env, static_cast<jstring>(s.get()));
-}
 
 void ThrowOn(const std::string &method, int times) {
     jvm::CallStaticVoid(kJournal, "throwOn", "(Ljava/lang/String;I)V", JStr(method).get(), jint{times});
@@ -98,8 +73,6 @@ void ThrowOn(const std::string &method, int times) {
 void ReturnNull(const std::string &method, bool on) {
     jvm::CallStaticVoid(kJournal, "returnNull", "(Ljava/lang/String;Z)V", JStr(method).get(), jboolean{on});
 }
-
-void SetPrinterStatus(int status) { jvm::CallStaticVoid(kJournal, "setPrinterStatus", "(I)V", jint{status}); }
 
 void SetInterpreters(const std::vector<int> &ids) {
     JNIEnv *env = jvm::Env();
@@ -120,8 +93,8 @@ void SetIntReply(const std::string &method, int reply) {
 }
 
 void SetBytesReply(const std::string &method, const std::string &bytes) {
-    LocalRef<jbyteArray> a{jvm::Env(), jvm::ByteArray(jvm::Env(), bytes)};
-    jvm::CallStaticVoid(kJournal, "setBytesReply", "(Ljava/lang/String;[B)V", JStr(method).get(), a.get());
+    jvm::CallStaticVoid(kJournal, "setBytesReply", "(Ljava/lang/String;[B)V", JStr(method).get(),
+                        jvm::ByteArray(bytes).get());
 }
 
 }  // namespace fixtures

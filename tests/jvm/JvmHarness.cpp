@@ -16,6 +16,8 @@
 namespace jvm {
 namespace {
 
+using jvmhost::TakeException;
+
 std::once_flag gCreate;
 std::mutex gClassMutex;
 std::map<std::string, jclass> gClasses;
@@ -135,9 +137,10 @@ jobject New(const char *className) {
     return global;
 }
 
-jstring Str(JNIEnv *env, const char *text) {
-    if (!text) return nullptr;
-    jstring s = env->NewStringUTF(text);
+LocalRef<jstring> Str(const char *text) {
+    JNIEnv *env = Env();
+    if (!text) return {env, nullptr};
+    LocalRef<jstring> s{env, env->NewStringUTF(text)};
     FailOnException(env, "NewStringUTF");
     return s;
 }
@@ -155,17 +158,17 @@ std::string Bytes(JNIEnv *env, jbyteArray a) {
     return bytes;
 }
 
-jbyteArray ByteArray(JNIEnv *env, const std::string &bytes) {
-    jbyteArray a = env->NewByteArray(static_cast<jsize>(bytes.size()));
+LocalRef<jbyteArray> ByteArray(const std::string &bytes) {
+    JNIEnv *env = Env();
+    LocalRef<jbyteArray> a{env, env->NewByteArray(static_cast<jsize>(bytes.size()))};
     if (!a) {
         FailOnException(env, "NewByteArray");
-        return nullptr;
+        return a;
     }
-    env->SetByteArrayRegion(a, 0, static_cast<jsize>(bytes.size()), reinterpret_cast<const jbyte *>(bytes.data()));
+    env->SetByteArrayRegion(a.get(), 0, static_cast<jsize>(bytes.size()),
+                            reinterpret_cast<const jbyte *>(bytes.data()));
     return a;
 }
-
-std::string TakeException(JNIEnv *env) { return jvmhost::TakeException(env); }
 
 // The Call* entries: varargs taken here, the call made through Instance/Static.
 #define JVM_INSTANCE_CALL(R, Name, Jni, Failed)                                                         \
@@ -185,7 +188,6 @@ std::string TakeException(JNIEnv *env) { return jvmhost::TakeException(env); }
         return r;                                                                                               \
     }
 JVM_INSTANCE_CALL(jint, CallInt, CallIntMethodV, jint{0})
-JVM_INSTANCE_CALL(jobject, CallObject, CallObjectMethodV, jobject{})
 JVM_STATIC_CALL(jint, CallStaticInt, CallStaticIntMethodV, jint{0})
 JVM_STATIC_CALL(jlong, CallStaticLong, CallStaticLongMethodV, jlong{0})
 JVM_STATIC_CALL(jboolean, CallStaticBoolean, CallStaticBooleanMethodV, jboolean{JNI_FALSE})

@@ -15,6 +15,8 @@
 #include <functional>
 #include <string>
 
+#include "common/JniUtil.h"
+
 namespace jvm {
 
 // Java classes, by JNI name.
@@ -41,26 +43,23 @@ jclass Class(const char *name);
 // as a global reference (never released: objects handed to the reader must
 // outlive the test anyway). Adds a test failure and returns null on failure.
 jobject New(const char *className);
-// A Java string as a local reference of the calling thread (null for null).
-jstring Str(JNIEnv *env, const char *text);
+// A Java string of the calling thread, released at scope end (null for null;
+// a temporary lives to the end of the call it is passed to).
+LocalRef<jstring> Str(const char *text);
 // The modified-UTF-8 text of a Java string ("" for null).
 std::string Text(JNIEnv *env, jstring s);
 // The bytes of a Java byte array ("" for null).
 std::string Bytes(JNIEnv *env, jbyteArray a);
-// A new byte array with `bytes` as a local reference.
-jbyteArray ByteArray(JNIEnv *env, const std::string &bytes);
-
-// Clears a pending Java exception and returns its toString() ("" when none).
-std::string TakeException(JNIEnv *env);
+// A new byte array with `bytes`, released at scope end.
+LocalRef<jbyteArray> ByteArray(const std::string &bytes);
 
 // Calls an instance method found by name and signature on the object's runtime
 // class, with JNI varargs. A missing method or a Java exception becomes a test
 // failure (the exception is cleared, so no JNI warning follows).
 void CallVoid(jobject obj, const char *name, const char *sig, ...);
 jint CallInt(jobject obj, const char *name, const char *sig, ...);
-// Object results are local references of the calling thread.
-jobject CallObject(jobject obj, const char *name, const char *sig, ...);
-// The same for static methods of a class (JNI name).
+// The same for static methods of a class (JNI name); object results are local
+// references of the calling thread.
 void CallStaticVoid(const char *cls, const char *name, const char *sig, ...);
 jint CallStaticInt(const char *cls, const char *name, const char *sig, ...);
 jlong CallStaticLong(const char *cls, const char *name, const char *sig, ...);

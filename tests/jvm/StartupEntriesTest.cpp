@@ -28,10 +28,8 @@ protected:
     // Both entries, each on a thread of its own as the service calls them.
     void Start(const char *model) {
         jvm::RunOnThread(
-            [&](JNIEnv *env) {
-                jstring name = jvm::Str(env, model);  // CallVoid fails the test on any Java exception
-                jvm::CallVoid(service_, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", name);
-                if (name) env->DeleteLocalRef(name);
+            [&](JNIEnv *) {  // CallVoid fails the test on any Java exception
+                jvm::CallVoid(service_, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", jvm::Str(model).get());
             },
             "service-start");
         jvm::RunOnThread([&](JNIEnv *) { jvm::CallVoid(service_, "initDevice", "()V"); }, "service-init");

@@ -65,9 +65,7 @@ protected:
     }
     jobject Of(const char *cls) const { return cls == jvm::kPluginAdapter ? plugin_ : kivoro_; }
     // Calls `method(byte[])`; a null `bytes` passes null.
-    static LocalRef<jbyteArray> Array(const std::string &bytes) {
-        return {jvm::Env(), jvm::ByteArray(jvm::Env(), bytes)};
-    }
+    static LocalRef<jbyteArray> Array(const std::string &bytes) { return jvm::ByteArray(bytes); }
     void Call(jobject obj, const char *method, const std::string *bytes) {
         jvm::CallVoid(obj, method, "([B)V", bytes ? Array(*bytes).get() : nullptr);
     }

@@ -21,13 +21,8 @@ struct Tracked {
 };
 
 Tracked Make(const char *cls) {
-    JNIEnv *env = jvm::Env();
-    jclass c = jvm::Class(cls);
-    jmethodID init = env->GetMethodID(c, "<init>", "()V");
-    jobject local = env->NewObject(c, init);
-    Tracked t{env->NewGlobalRef(local), env->NewWeakGlobalRef(local)};
-    env->DeleteLocalRef(local);
-    return t;
+    jobject global = jvm::New(cls);
+    return {global, jvm::Env()->NewWeakGlobalRef(global)};
 }
 
 void Drop(Tracked &t) {
@@ -59,9 +54,9 @@ TEST_F(PrintEntry, MissingStringReleasesTheDaemonAndReturns) {
     };
     for (const auto &r : rows) {
         SCOPED_TRACE(r.named);
-        Tracked daemon = Make(fixtures::kRecordingDaemon), maa = Make(fixtures::kRecordingMaa);
+        Tracked daemon = Make(fixtures::kRecordingDaemon), maa = Make(fixtures::kRecordingDaemon);
         jvm::RunOnThread(
-            [&](JNIEnv *env) { ReadPrintMsg(env, daemon.global, maa.global, r.manufacturer, r.model, r.deviceClass); },
+            [&](JNIEnv *) { ReadPrintMsg(daemon.global, maa.global, r.manufacturer, r.model, r.deviceClass); },
             "print-entry");
         EXPECT_EQ(LoggerHost_Count("[USBAdp] GetStringUTFChars[" + std::string(r.named) + "] returns NULL\n"), 1);
         Drop(daemon);
@@ -79,18 +74,18 @@ TEST_F(PrintEntry, MissingStringReleasesTheDaemonAndReturns) {
 }
 
 TEST_F(PrintEntry, CallAfterAFailedOneReleasesItsMaaObjectAndStartsTheReader) {
-    Tracked daemon1 = Make(fixtures::kRecordingDaemon), maa1 = Make(fixtures::kRecordingMaa);
+    Tracked daemon1 = Make(fixtures::kRecordingDaemon), maa1 = Make(fixtures::kRecordingDaemon);
     CreateQueues(daemon1.global);
     if (HasFatalFailure()) return;
     jvm::RunOnThread(
-        [&](JNIEnv *env) { ReadPrintMsg(env, daemon1.global, maa1.global, "Tarnwel", "TW-4020", nullptr); },
+        [&](JNIEnv *) { ReadPrintMsg(daemon1.global, maa1.global, "Tarnwel", "TW-4020", nullptr); },
         "entry-1");
     Drop(maa1);
     LoggerHost_StartCapture();
 
-    Tracked daemon2 = Make(fixtures::kDaemonWithoutUpcalls), maa2 = Make(fixtures::kRecordingMaa);
+    Tracked daemon2 = Make(jvm::kPrintAndScanService), maa2 = Make(fixtures::kRecordingDaemon);
     jobject d2 = daemon2.global, m2 = maa2.global;
-    jvm::StartDetached([d2, m2](JNIEnv *env) { ReadPrintMsg(env, d2, m2, "Tarnwel", "TW-4020", "printer"); },
+    jvm::StartDetached([d2, m2](JNIEnv *) { ReadPrintMsg(d2, m2, "Tarnwel", "TW-4020", "printer"); },
                        "entry-2");
     ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp]Inside USBAdapter_IF_PrintFunction"); }));
     EXPECT_EQ(LoggerHost_Count(kAlreadyRunning), 0);
@@ -111,11 +106,11 @@ TEST_F(PrintEntry, CallWhileTheReaderRunsIsRefusedAndTheReaderKeepsItsObjects) {
     LoggerHost_StartCapture();
 
     // Objects without call-backs: a job or query that reached them would fail.
-    jobject daemon2 = jvm::New(fixtures::kDaemonWithoutUpcalls), maa2 = jvm::New(fixtures::kRecordingMaa);
+    jobject daemon2 = jvm::New(jvm::kPrintAndScanService), maa2 = jvm::New(jvm::kPrintAndScanService);
     auto returned = std::make_shared<std::atomic<bool>>(false);
     jvm::StartDetached(
-        [daemon2, maa2, returned](JNIEnv *env) {
-            ReadPrintMsg(env, daemon2, maa2, "Other", "TW-9999", "printer");
+        [daemon2, maa2, returned](JNIEnv *) {
+            ReadPrintMsg(daemon2, maa2, "Other", "TW-9999", "printer");
             *returned = true;
         },
         "entry-2");
@@ -135,7 +130,7 @@ TEST_F(PrintEntry, CallWhileTheReaderRunsIsRefusedAndTheReaderKeepsItsObjects) {
     ASSERT_TRUE(fixtures::AwaitJobEnded(0, 10000));
     EXPECT_EQ(fixtures::JobBytes(0), job);
     EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in RegisterJob()::can't find processPrintCommand().\n"), 0);
-    fixtures::SetPrinterStatus(2);
+    fixtures::SetIntReply("getPrinterStatus", 2);
     // The set-up asked once already, for the Device ID.
     const int asked = fixtures::Calls("getPrinterStatus");
     EXPECT_EQ(fetch(), 2u);

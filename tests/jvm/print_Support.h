@@ -31,17 +31,10 @@ inline constexpr const char *kReadPrintMsgSig =
     "(Ljava/lang/Object;Ljava/lang/String;Ljava/lang/String;Ljava/lang/String;I)V";
 
 // Calls readPrintMsg on `daemon` on the calling thread; null texts pass null.
-inline void ReadPrintMsg(JNIEnv *env, jobject daemon, jobject maa, const char *manufacturer, const char *model,
-                         const char *deviceClass, jint fax = 1) {
-    jclass cls = jvm::Class(jvm::kPrintAndScanService);
-    jmethodID mid = env->GetMethodID(cls, "readPrintMsg", kReadPrintMsgSig);
-    ASSERT_NE(mid, nullptr);
-    jstring m = jvm::Str(env, manufacturer), p = jvm::Str(env, model), c = jvm::Str(env, deviceClass);
-    env->CallVoidMethod(daemon, mid, maa, m, p, c, fax);
-    std::string ex = jvm::TakeException(env);
-    EXPECT_EQ(ex, "") << "readPrintMsg threw";
-    for (jstring s : {m, p, c})
-        if (s) env->DeleteLocalRef(s);
+inline void ReadPrintMsg(jobject daemon, jobject maa, const char *manufacturer, const char *model,
+                         const char *deviceClass) {
+    jvm::CallVoid(daemon, "readPrintMsg", kReadPrintMsgSig, maa, jvm::Str(manufacturer).get(), jvm::Str(model).get(),
+                  jvm::Str(deviceClass).get(), jint{1});
 }
 
 inline mfp_notif_t Notification(U8 code) {
@@ -102,18 +95,18 @@ protected:
     }
     void TearDown() override { RemoveQueues(root_); }
 
-    // Queues created through `daemon` (it is a service object), then the reader
-    // started on its own thread. With `configure` the print node is set up and
-    // the host configures the device, so the reader is polling on return.
+    // Queues created through the daemon (it is a service object), then the
+    // reader started on its own thread, the daemon its MAA object too. With
+    // `configure` the print node is set up and the host configures the device,
+    // so the reader is polling on return.
     void StartReader(const char *daemonClass = fixtures::kRecordingDaemon, bool configure = true) {
         daemon_ = jvm::New(daemonClass);
-        maa_ = jvm::New(fixtures::kRecordingMaa);
         ASSERT_NE(daemon_, nullptr);
         CreateQueues(daemon_);
         if (HasFatalFailure()) return;
-        jobject daemon = daemon_, maa = maa_;
+        jobject daemon = daemon_;
         jvm::StartDetached(
-            [daemon, maa](JNIEnv *e) { printjvm::ReadPrintMsg(e, daemon, maa, "Tarnwel", "TW-4020 MFP", "printer"); },
+            [daemon](JNIEnv *) { printjvm::ReadPrintMsg(daemon, daemon, "Tarnwel", "TW-4020 MFP", "printer"); },
             "print-reader");
         if (!configure) {
             ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp]Inside USBAdapter_IF_PrintFunction"); }));
@@ -129,10 +122,7 @@ protected:
     // The service queues, made through `service`: a reader that gets in then
     // waits on its queue.
     void CreateQueues(jobject service) {
-        JNIEnv *env = jvm::Env();
-        jstring model = jvm::Str(env, "TW-4020 MFP");
-        jvm::CallVoid(service, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", model);
-        env->DeleteLocalRef(model);
+        jvm::CallVoid(service, "creatPrnScanMsgQs", "(Ljava/lang/String;)V", jvm::Str("TW-4020 MFP").get());
         ASSERT_GE(QueueOf(root_, 5), 0);
     }
 
@@ -142,5 +132,4 @@ protected:
 
     TempRoot root_;
     jobject daemon_ = nullptr;
-    jobject maa_ = nullptr;
 };
