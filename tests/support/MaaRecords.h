@@ -6,15 +6,14 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include <fstream>
 #include <optional>
 #include <ostream>
-#include <sstream>
 #include <string>
 #include <vector>
 
 #include "common/ByteOrder.h"
 #include "maa/MAA_Types.h"
+#include "support/Bytes.h"
 
 namespace maarec {
 
@@ -77,11 +76,6 @@ inline std::string Pattern(size_t n) {
     std::string s(n, '\0');
     for (size_t i = 0; i < n; ++i) s[i] = static_cast<char>(i * 7 + 3);
     return s;
-}
-inline std::string ReadFile(const std::string &path) {
-    std::stringstream ss;
-    ss << std::ifstream(path, std::ios::binary).rdbuf();
-    return ss.str();
 }
 // The session's channel as a packet socket pair: the device writes on
 // `device`, and each of its writes is read back apart, one string each.

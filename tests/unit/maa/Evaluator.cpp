@@ -140,37 +140,34 @@ TEST_F(Evaluator, CallsAndTheRecordsTheyWrite) {
     EXPECT_TRUE(calls.empty());
     MAA_SymbolAddGeneral(ftarget_ppc, "MAA_GENERAL_FUNCTION", MAA_SYM_FUNC_HIDE, MAA_AddrGeneralHandle(&general), 2);
     struct Case {
-        const char *line;
-        TMAASpecialMode mode;
-        const char *value, *called;  // functions with their words
+        const char *line, *value, *called;  // functions with their words
         Recs written;
-        const char *logged;
+        const char *logged = nullptr;
+        TMAASpecialMode mode = MAA_NORMAL_CMD;
     } cases[] = {
-        {"x = f3(1, -2, x)", MAA_NORMAL_CMD, "ValueRef = 1 = 0x1", "f3(1,4294967294,0)", {End("f3 done", 1)},
+        {"x = f3(1, -2, x)", "ValueRef = 1 = 0x1", "f3(1,4294967294,0)", {End("f3 done", 1)},
          "[MAA_FuncCall]: MAA_WriteResult\n"},  // a call's value is 1
-        {"f10(1,2,3,4,5,6,7,8,9,10)", MAA_NORMAL_CMD, "ValueNum = 1 = 0x1", "f10(1,2,3,4,5,6,7,8,9,10)",
-         {End("f10 done", 1)}, nullptr},
+        {"f10(1,2,3,4,5,6,7,8,9,10)", "ValueNum = 1 = 0x1", "f10(1,2,3,4,5,6,7,8,9,10)", {End("f10 done", 1)}},
         // A wrong count calls and writes nothing; eleven arguments are too many.
-        {"f3(1, 2)", MAA_NORMAL_CMD, "ValueNum = 0 = 0x0", "", {}, nullptr},
-        {"f(1)", MAA_NORMAL_CMD, "ValueNum = 0 = 0x0", "", {}, nullptr},
-        {"f10(1,2,3,4,5,6,7,8,9,10,11)", MAA_NORMAL_CMD, "ValueNum = 0 = 0x0", "", {}, "too many args\n"},
-        {"nope(1,2,3,4,5,6,7,8,9,10,11)", MAA_NORMAL_CMD, "ValueNum = 0 = 0x0", "", {}, "too many args\n"},
+        {"f3(1, 2)", "ValueNum = 0 = 0x0", "", {}},
+        {"f(1)", "ValueNum = 0 = 0x0", "", {}},
+        {"f10(1,2,3,4,5,6,7,8,9,10,11)", "ValueNum = 0 = 0x0", "", {}, "too many args\n"},
+        {"nope(1,2,3,4,5,6,7,8,9,10,11)", "ValueNum = 0 = 0x0", "", {}, "too many args\n"},
         // Unregistered names reach the general function with the count.
-        {"nope(7, 8)", MAA_NORMAL_CMD, "ValueNum = 1 = 0x1", "general(7,8)", {End("general done", 1)},
-         "MAA_FuncCall - IsGeneralFunc 1\n"},
-        {"other()", MAA_NORMAL_CMD, "ValueNum = 1 = 0x1", "general()", {End("general done", 1)}, "pstSymbol is Null\n"},
-        {"nope(1,2,3,4,5,6,7,8,9,10)", MAA_NORMAL_CMD, "ValueNum = 1 = 0x1", "general(1,2,3,4,5,6,7,8,9,10)",
-         {End("general done", 1)}, nullptr},
+        {"nope(7, 8)", "ValueNum = 1 = 0x1", "general(7,8)", {End("general done", 1)}, "MAA_FuncCall - IsGeneralFunc 1\n"},
+        {"other()", "ValueNum = 1 = 0x1", "general()", {End("general done", 1)}, "pstSymbol is Null\n"},
+        {"nope(1,2,3,4,5,6,7,8,9,10)", "ValueNum = 1 = 0x1", "general(1,2,3,4,5,6,7,8,9,10)",
+         {End("general done", 1)}},
         // Every operand is evaluated: there is no short circuit.
-        {"1 ? f() : g()", MAA_NORMAL_CMD, nullptr, "f0() g0()", {End("f0 done"), End("g0 done")}, nullptr},
-        {"0 && f()", MAA_NORMAL_CMD, nullptr, "f0()", {End("f0 done")}, nullptr},
-        {"1 |& g()", MAA_NORMAL_CMD, nullptr, "g0()", {End("g0 done")}, nullptr},
+        {"1 ? f() : g()", nullptr, "f0() g0()", {End("f0 done"), End("g0 done")}},
+        {"0 && f()", nullptr, "f0()", {End("f0 done")}},
+        {"1 |& g()", nullptr, "g0()", {End("g0 done")}},
         // Scanner functions write their own record; none-results and stored runs write nothing.
-        {"scan1(4)", MAA_NORMAL_CMD, nullptr, "scan1(4)", {End("scan1 done", 1)}, nullptr},
-        {"silent()", MAA_NORMAL_CMD, nullptr, "silent0()", {}, nullptr},
-        {"f()", MAA_AUTO_RUN_CMD, nullptr, "f0()", {}, nullptr},
-        {"g()", MAA_JIG_RUN_CMD, nullptr, "g0()", {}, nullptr},
-        {"f()", MAA_AUTO_SAVE_CMD, nullptr, "f0()", {End("f0 done")}, nullptr},
+        {"scan1(4)", nullptr, "scan1(4)", {End("scan1 done", 1)}},
+        {"silent()", nullptr, "silent0()", {}},
+        {"f()", nullptr, "f0()", {}, nullptr, MAA_AUTO_RUN_CMD},
+        {"g()", nullptr, "g0()", {}, nullptr, MAA_JIG_RUN_CMD},
+        {"f()", nullptr, "f0()", {End("f0 done")}, nullptr, MAA_AUTO_SAVE_CMD},
     };
     for (const Case &c : cases) {
         SCOPED_TRACE(c.line);

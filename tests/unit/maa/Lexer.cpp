@@ -25,11 +25,6 @@ protected:
         return out;
     }
     inline static std::vector<std::string> names;
-    static U32 single(const char *line) {
-        auto t = tokens(line);
-        EXPECT_EQ(t.size(), 1u) << line;
-        return t.empty() ? 0 : t.front();
-    }
     static U32 constant(const char *line) {
         lineBuffer = line;
         MAA_InputSet(reinterpret_cast<const U8 *>(lineBuffer.c_str()));
@@ -40,18 +35,39 @@ protected:
 
 constexpr U32 I = IDENTIFIER;
 
-// Operators take the longest match; a name beginning with a type word is that type word.
-TEST_F(Lexer, TokensOfALine) {
-    struct Case { const char *text; std::vector<U32> expected; } cases[] = {
+// Operators take the longest match; a name beginning with a type word is that
+// type word. Where a line ends early: an unterminated string or an unknown
+// character ends it there, an unknown escape rejects all of it.
+TEST_F(Lexer, TokensOfALineAndWhereItEnds) {
+    struct Case {
+        const char *text;
+        std::vector<U32> expected;
+        bool rejected = false;
+        const char *logged = nullptr;
+    } cases[] = {
         {"a|&b", {I, LOR, I}}, {"a||b", {I, '|', '|', I}}, {"x<<=2", {I, LSE, CONSTANT}}, {"x<<2", {I, LS, CONSTANT}},
         {"x>>=2 x>>2 x>=2 x<=2", {I, RSE, CONSTANT, I, RS, CONSTANT, I, GE, CONSTANT, I, LE, CONSTANT}},
         {"== != += ++ -= -- *= /= %= ^= &= && |=", {EQ, NE, PE, PP, ME, MM, TE, DE, RE, EXE, AE, LAND, OE}},
         {"+++", {PP, '+'}}, {" \t\v\f\r\n x", {I}}, {"integer", {R_INT}},
         {"( ) , : ; ? ~ ! % & * + - / < = > ^ |",
          {'(', ')', ',', ':', ';', '?', '~', '!', '%', '&', '*', '+', '-', '/', '<', '=', '>', '^', '|'}},
-        {"longitude chart shortcut int", {R_LONG, R_CHAR, R_SHORT, R_INT}}, {"Int in_1x _9", {I, I, I}},  // names last
+        {"longitude chart shortcut int", {R_LONG, R_CHAR, R_SHORT, R_INT}},
+        {"x \"abc", {I}, false, "\r\ninvalid string"},
+        {"f(1) [2]", {I, '(', CONSTANT, ')'}}, {"a.b", {I}}, {"\xc3\xa9", {}},
+        {"'ab'", {}, false, "\r\ninvalid charactor constant"},
+        {"\"a\\qb\" x", {}, true, "*ptr >= '0' && *ptr <= '7'"},
+        {"'\\z'", {}, true}, {"\"\\", {}, true},  // the last: backslash at the end of the line
+        {"Int in_1x _9", {I, I, I}},  // names last
     };
-    for (const Case &c : cases) EXPECT_EQ(tokens(c.text), c.expected) << c.text;
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.text);
+        LoggerHost_StartCapture();
+        EXPECT_EQ(tokens(c.text), c.expected);
+        EXPECT_EQ(MAA_TokenDivider(), 0u);
+        EXPECT_EQ(fMAALineReject, c.rejected);
+        if (c.logged) { EXPECT_TRUE(LoggerHost_Contains(c.logged)); }
+        EXPECT_EQ(ulAllocCount, 0u);
+    }
     EXPECT_EQ(names, (std::vector<std::string>{"Int", "in_1x", "_9"}));
 }
 
@@ -102,30 +118,6 @@ TEST_F(Lexer, StringLiteralsAreDecodedRecordedAndAddressable) {
     MAA_FreeParamString();
     EXPECT_EQ(ulAllocCount, 0u);
     EXPECT_EQ(MAA_AddrString(address), nullptr);  // gone with the line
-}
-
-// Where a line ends early: an unterminated string or an unknown character
-// ends it there, an unknown escape rejects all of it.
-TEST_F(Lexer, LinesThatEndEarlyOrAreRejected) {
-    struct Case { const char *text; std::vector<U32> expected; bool rejected; const char *logged; } cases[] = {
-        {"x \"abc", {I}, false, "\r\ninvalid string"},
-        {"f(1) [2]", {I, '(', CONSTANT, ')'}, false, nullptr},
-        {"a.b", {I}, false, nullptr},
-        {"\xc3\xa9", {}, false, nullptr},
-        {"'ab'", {}, false, "\r\ninvalid charactor constant"},
-        {"\"a\\qb\" x", {}, true, "*ptr >= '0' && *ptr <= '7'"},
-        {"'\\z'", {}, true, nullptr},
-        {"\"\\", {}, true, nullptr},  // backslash at the end of the line
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(c.text);
-        LoggerHost_StartCapture();
-        EXPECT_EQ(tokens(c.text), c.expected);
-        EXPECT_EQ(MAA_TokenDivider(), 0u);
-        EXPECT_EQ(fMAALineReject, c.rejected);
-        if (c.logged) { EXPECT_TRUE(LoggerHost_Contains(c.logged)); }
-        EXPECT_EQ(ulAllocCount, 0u);
-    }
 }
 
 TEST_F(Lexer, TwentyStringLiteralsFitATwentyFirstRejectsTheLine) {

@@ -7,14 +7,18 @@ namespace {
 
 class Symbols : public ShellTest {};
 
-TEST_F(Symbols, TheNewestOfTwoEqualNamesIsFoundFirst) {
+TEST_F(Symbols, TheNewestOfTwoEqualNamesIsFoundFirstAndEachKeepsItsOwnCopyOfTheName) {
     U32 first = MAA_FuncEntry<f0>(), second = MAA_FuncEntry<g0>();
-    MAA_SymbolAdd(ftarget_ppc, "f", MAA_SYM_FUNC_HIDE, first, 0);
+    char name[] = "f";
+    MAA_SymbolAdd(ftarget_ppc, name, MAA_SYM_FUNC_HIDE, first, 0);
     MAA_SymbolAdd(ftarget_ppc, "f", MAA_SYM_FUNC_HIDE, second, 0);
+    name[0] = 'x';
     EXPECT_TRUE(LoggerHost_Contains("\r\n Add Symbol Start:f"));
     ASSERT_NE(MAA_SymbolFind("f"), nullptr);
     EXPECT_EQ(MAA_SymbolFind("f")->ulAddress, second);
+    ASSERT_NE(MAA_SymbolFindAddress(first), nullptr);
     EXPECT_EQ(MAA_SymbolFindAddress(first)->ulAddress, first);
+    EXPECT_STREQ(reinterpret_cast<const char *>(MAA_SymbolFindAddress(first)->pubName), "f");
     EXPECT_EQ(MAA_SymbolFindAddress(second)->ulAddress, second);
     EXPECT_EQ(MAA_SymbolFind("F"), nullptr);  // case-sensitive
     EXPECT_EQ(MAA_SymbolFind("f "), nullptr);  // whole names
@@ -23,16 +27,6 @@ TEST_F(Symbols, TheNewestOfTwoEqualNamesIsFoundFirst) {
     run("f()");
     ASSERT_EQ(calls.size(), 1u);
     EXPECT_EQ(calls[0].function, "g0");
-}
-
-TEST_F(Symbols, TheTableKeepsItsOwnCopyOfTheName) {
-    char name[] = "temp";
-    MAA_SymbolAdd(ftarget_ppc, name, MAA_SYM_FUNC, 123, 1);
-    name[0] = 'x';
-    TSymbol *sym = MAA_SymbolFind("temp");
-    ASSERT_NE(sym, nullptr);
-    EXPECT_EQ(sym->ubPramCount, 1);
-    EXPECT_EQ(sym->fMaaTarget, ftarget_ppc);
 }
 
 TEST_F(Symbols, OneGeneralFunctionTheLaterReplacesTheEarlier) {

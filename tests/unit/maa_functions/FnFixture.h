@@ -88,6 +88,12 @@ protected:
         MAA_InputSet(reinterpret_cast<const U8 *>(kept.c_str()));
         return MAA_Parser();
     }
+    // What the host receives from one command line through the shell.
+    static Recs HostSees(const std::string &line) {
+        written.clear();
+        EXPECT_EQ(Run(line), 0u) << line;
+        return written;
+    }
     // The address of a copy of `text` in the shell's map, NUL included.
     U32 Map(const std::string &text) {
         std::string &kept = texts_.emplace_back(text);

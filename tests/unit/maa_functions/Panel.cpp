@@ -28,13 +28,6 @@ protected:
 
     void writeAddress(const std::string &text) { std::ofstream(root / kAddressFile, std::ios::binary) << text; }
     static void usePort(uint16_t port) { ::setenv("USBADAPTER_UI_PORT", std::to_string(port).c_str(), 1); }
-
-    // What the host receives from one command line.
-    static Recs HostSees(const char *line) {
-        written.clear();
-        EXPECT_EQ(Run(line), 0u) << line;
-        return written;
-    }
 };
 
 // Each registered name, called through the shell, which writes the returned record.

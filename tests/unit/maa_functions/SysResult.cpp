@@ -77,9 +77,7 @@ TEST_F(SysResult, AReplacedRunnerSeesEveryCommandTheDefaultLogsOrRunsThroughTheS
     EXPECT_TRUE(std::ifstream(marker).good());
 }
 
-TEST_F(SysResult, AReplacedSleeperTakesEveryPauseAndTheDefaultReallyWaits) {
-    MAA_SleepMs(1000);
-    EXPECT_EQ(sleeps, std::vector<U32>{1000});
+TEST_F(SysResult, TheDefaultSleeperReallyWaits) {
     MAA_SetSleeper(nullptr);
     auto start = std::chrono::steady_clock::now();
     MAA_SleepMs(120);

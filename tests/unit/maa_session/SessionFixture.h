@@ -33,11 +33,7 @@ namespace maasession {
 
 using namespace maarec;
 
-// A literal with NUL bytes in it.
-template <size_t N>
-std::string S(const char (&text)[N]) {
-    return std::string(text, N - 1);
-}
+using namespace std::string_literals;  // "..."s keeps NUL bytes
 inline std::string Str(const std::vector<uint8_t> &v) { return std::string(v.begin(), v.end()); }
 
 // Registered functions (kind 1). A probe's argument is its result code; a
