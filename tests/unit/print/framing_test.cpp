@@ -110,8 +110,7 @@ TEST_F(Framing, HeldUelBytesBecomeAJobOfTheirOwnAfterSilence) {
 // is last in the read and the job's first.
 TEST_F(Framing, TransfersMakeTheJobsOfTheStream) {
     const struct {
-        const char *transfers[3];
-        const char *jobs[2];
+        std::vector<std::string> transfers, jobs;
         bool silenceEnds;  // the last job is open until the silence after the transfers
         const char *line;
     } rows[] = {
@@ -127,16 +126,11 @@ TEST_F(Framing, TransfersMakeTheJobsOfTheStream) {
         SCOPED_TRACE(r.jobs[0]);
         Restart();
         LoggerHost_StartCapture();
-        std::vector<std::string> transfers, jobs;
-        for (const char *t : r.transfers)
-            if (t) transfers.push_back(t);
-        for (const char *j : r.jobs)
-            if (j) jobs.push_back(j);
-        Send(transfers, false);
-        ASSERT_EQ(rec::Jobs().size(), jobs.size());
+        Send(r.transfers, false);
+        ASSERT_EQ(rec::Jobs().size(), r.jobs.size());
         EXPECT_EQ(rec::Jobs().back().ended, !r.silenceEnds);
         Silence();
-        ExpectJobs(jobs);
+        ExpectJobs(r.jobs);
         ExpectLoggedOnce(r.line);
     }
 }
