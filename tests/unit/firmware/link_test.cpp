@@ -212,15 +212,6 @@ TEST_F(LinkTest, SilentManagerTimesOutAfterFiveAndAHalfSeconds) {
     EXPECT_EQ(LoggerHost_Count("timeout!!!\n"), 1);
 }
 
-TEST_F(LinkTest, NoManagerListeningIsAFailedConnect) {
-    ScriptedPeer *none = new ScriptedPeer("", 0);
-    const uint16_t port = none->port();
-    delete none;  // the port is free again: nobody listens
-    UsePort(port);
-    EXPECT_EQ(connect_server(LOCALHOST), -1);
-    EXPECT_EQ(LoggerHost_Count("can't connect to a server!!!\n"), 1);
-}
-
 TEST_F(LinkTest, ImageHandedToThePlatformWriterInBlocks) {
     std::ofstream(TEMP_FW_IMAGE, std::ios::binary) << RandomBytes(0x10000 * 2 + 5, 1);
     EXPECT_EQ(write_to_update_manager(0x10000 * 2 + 5), 0);

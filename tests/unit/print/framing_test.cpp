@@ -110,8 +110,7 @@ TEST_F(Framing, HeldUelBytesBecomeAJobOfTheirOwnAfterSilence) {
 // is last in the read and the job's first.
 TEST_F(Framing, TransfersMakeTheJobsOfTheStream) {
     const struct {
-        const char *transfers[3];
-        const char *jobs[2];
+        std::vector<std::string> transfers, jobs;
         bool silenceEnds;  // the last job is open until the silence after the transfers
         const char *line;
     } rows[] = {
@@ -127,16 +126,11 @@ TEST_F(Framing, TransfersMakeTheJobsOfTheStream) {
         SCOPED_TRACE(r.jobs[0]);
         Restart();
         LoggerHost_StartCapture();
-        std::vector<std::string> transfers, jobs;
-        for (const char *t : r.transfers)
-            if (t) transfers.push_back(t);
-        for (const char *j : r.jobs)
-            if (j) jobs.push_back(j);
-        Send(transfers, false);
-        ASSERT_EQ(rec::Jobs().size(), jobs.size());
+        Send(r.transfers, false);
+        ASSERT_EQ(rec::Jobs().size(), r.jobs.size());
         EXPECT_EQ(rec::Jobs().back().ended, !r.silenceEnds);
         Silence();
-        ExpectJobs(jobs);
+        ExpectJobs(r.jobs);
         ExpectLoggedOnce(r.line);
     }
 }
@@ -196,34 +190,27 @@ TEST_F(Framing, RefusedJobDropsItsChunkAndTheNextChunkTriesAgain) {
     ExpectJobs({"ab"});
 }
 
-TEST_F(Framing, HostApplicationBetweenJobsIsNotPrintData) {
-    // An ND packet of header only, between two print jobs.
-    std::string nd = {'\x1b', '\x91', 0, 0, 0, 0, 0, 0x0D, 0, 0, 0, 0, 0, 0, 0, 0};
-    Send({Framed("one"), nd, Framed("two")});
-    ExpectJobs({Framed("one"), Framed("two")});
-    auto apps = rec::Apps();
-    ASSERT_EQ(apps.size(), 1u);
-    EXPECT_EQ(apps[0].writes, (std::vector<std::string>{nd}));
-}
-
 // The reader takes a whole transfer at once; a host application that reads
 // the node itself must still find the transfer's rest there, in order, and
-// what it leaves is classified again, as if read from the node.
+// what it leaves is classified again, as if read from the node. A packet
+// between jobs is no print data.
 TEST_F(Framing, ApplicationsReadTheRestOfTheirTransfer) {
     auto header = [](char app, char len) { return std::string{'\x1b', '\x91', 0, 0, 0, 0, 0, app, 0, 0, 0, 0, 0, 0, 0, len}; };
-    const std::string nd = header(0x0D, 4), other = header(0x22, 0), big(3u << 19, 'b');
+    const std::string nd = header(0x0D, 4), bare = header(0x0D, 0), other = header(0x22, 0), big(3u << 19, 'b');
     struct Row {
         const char *what;
         std::vector<std::string> transfers;
         std::vector<std::string> appWrites;
-        std::string job;
-        std::vector<size_t> chunks;
+        std::vector<std::string> jobs;
+        std::vector<size_t> chunks;  // of the first job
     } const rows[] = {
-        {"packet and print data in one transfer", {nd + "body" + "print"}, {nd, "body"}, "print", {5}},
-        {"body cut across transfers", {nd + "bo", "dy" + Framed("x")}, {nd, "body"}, Framed("x"), {19}},
-        {"unknown header is print data", {other + "data"}, {}, other + "data", {20}},
+        {"packet between two jobs", {Framed("one"), bare, Framed("two")}, {bare}, {Framed("one"), Framed("two")},
+         {21}},
+        {"packet and print data in one transfer", {nd + "body" + "print"}, {nd, "body"}, {"print"}, {5}},
+        {"body cut across transfers", {nd + "bo", "dy" + Framed("x")}, {nd, "body"}, {Framed("x")}, {19}},
+        {"unknown header is print data", {other + "data"}, {}, {other + "data"}, {20}},
         // Longer than one read of data: the first chunk is as long as before.
-        {"unknown header, transfer longer than a read", {other + big}, {}, other + big,
+        {"unknown header, transfer longer than a read", {other + big}, {}, {other + big},
          {16 + (1u << 20), big.size() - (1u << 20)}},
     };
     LoggerHost_StopCapture();
@@ -238,8 +225,8 @@ TEST_F(Framing, ApplicationsReadTheRestOfTheirTransfer) {
             EXPECT_EQ(apps[0].writes, r.appWrites);
         }
         auto jobs = rec::Jobs();
-        ASSERT_EQ(jobs.size(), 1u);
-        EXPECT_TRUE(jobs[0].bytes == r.job);
+        ASSERT_EQ(jobs.size(), r.jobs.size());
+        for (size_t i = 0; i < jobs.size(); ++i) EXPECT_TRUE(jobs[i].bytes == r.jobs[i] && jobs[i].ended) << i;
         EXPECT_EQ(jobs[0].chunks, r.chunks);
     }
 }
