@@ -28,21 +28,12 @@
 #include <vector>
 
 #include "FuzzCheck.h"
+#include "HostTraffic.h"
 #include "firmware/FirmWareUpdate.h"
 #include "firmware/UpdateManager.h"
 #include "vdev.h"
 
 namespace {
-
-std::vector<std::string> Split(std::string_view s, std::string_view sep) {
-    std::vector<std::string> out;
-    for (;;) {
-        size_t at = s.find(sep);
-        out.emplace_back(s.substr(0, at));
-        if (at == std::string_view::npos) return out;
-        s.remove_prefix(at + sep.size());
-    }
-}
 
 int g_listen = -1;
 int g_wake[2] = {-1, -1};  // readable once the download has returned

@@ -45,6 +45,7 @@
 #include "maa/MAA_Result.h"
 #include "maa/functions/MAA_Panel.h"
 #include "UiPeer.h"
+#include "support/MaaRecords.h"
 #include "support/TempRoot.h"
 
 namespace {
@@ -88,17 +89,6 @@ const Fn kFns[] = {
     {Kind::Listening, noArg<UISSM_IF_LED_Test>, '2'},
 };
 constexpr size_t kFnCount = sizeof kFns / sizeof kFns[0];
-
-struct Record {
-    U32 status;
-    std::string text;
-};
-Record recordOf(const TMAAResult *r) {
-    return {r->enContinue,
-            std::string(reinterpret_cast<const char *>(r->pubData), r->pubData != nullptr ? r->ulDataSize : 0)};
-}
-std::vector<Record> written;
-void capture(const TMAAResult *r) { written.push_back(recordOf(r)); }
 
 // ---- the server's script ----------------------------------------------------------
 
@@ -298,12 +288,9 @@ extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     deadFd = loopbackSocket(false);
     serverPort = boundPort(listenFd);
     deadPort = boundPort(deadFd);
-    // For the listening tests: free now, and only they bind it.
-    const int probe = loopbackSocket(false);
-    listenPort = boundPort(probe);
-    ::close(probe);
+    listenPort = uipeer::FreePort();  // for the listening tests: free now, and only they bind it
     if (::pipe2(wakePipe, O_CLOEXEC) != 0) fail("no pipe");
-    MAA_SetResultWriter(&capture);
+    MAA_SetResultWriter(&maarec::Capture);
     std::thread(serverThread).detach();
     return 0;
 }
@@ -334,7 +321,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
         cv.notify_all();
     }
     IsDisconnected = pulled ? 1 : 0;
-    written.clear();
+    maarec::written.clear();
     stMAASysResult = {};
     TMAAResult *r = fn.call(arg);
     IsDisconnected = 0;
@@ -354,15 +341,15 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     // Records: the header, written at once; then the returned record: the
     // header again (no verdict) or the verdict, which ends the test.
     CHECK(r == &stMAASysResult, "the record returned is not the shell's result record");
-    CHECK(written.size() == 1, "not exactly one record written during the call");
-    const Record &header = written[0];
-    CHECK(header.status == MAA_RESULT_CONTINUE && startsWith(header.text, "[ ") && header.text.back() == ']',
+    CHECK(maarec::written.size() == 1, "not exactly one record written during the call");
+    const maarec::Rec &header = maarec::written[0];
+    CHECK(header.st == MAA_RESULT_CONTINUE && startsWith(header.data, "[ ") && header.data.back() == ']',
           "the first record is not the test's header");
-    const Record last = recordOf(r);
-    const bool verdict = last.status == MAA_RESULT_END;
-    CHECK(verdict || (last.status == MAA_RESULT_CONTINUE && last.text == header.text),
+    const maarec::Rec last = maarec::Of(r);
+    const bool verdict = last.st == MAA_RESULT_END;
+    CHECK(verdict || (last.st == MAA_RESULT_CONTINUE && last.data == header.data),
           "no verdict, yet the header was replaced");
-    CHECK(!verdict || (!last.text.empty() && last.text.find('\0') == std::string::npos), "an empty or binary verdict");
+    CHECK(!verdict || (!last.data.empty() && last.data.find('\0') == std::string::npos), "an empty or binary verdict");
 
     // Nothing left open: the test closed its end, and no descriptor remains.
     if (o.connected) CHECK(o.closedByTest, "the connection was left open");
