@@ -26,7 +26,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
@@ -34,7 +33,7 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <mutex>
+#include <future>
 #include <string>
 #include <thread>
 #include <vector>
@@ -140,23 +139,12 @@ uint16_t serverPort, listenPort, deadPort;
 int listenFd = -1, deadFd = -1;
 int wakePipe[2] = {-1, -1};  // readable once the call under test has returned
 
-struct Job {
-    bool peer = false;  // connect to a listening test instead of accepting
-    Script script;
-};
 struct Outcome {
     bool connected = false;
     bool closedByTest = false;  // the test's end was seen closed
     std::string request;        // what arrived before the first answer
     std::string after;          // what arrived after it
 };
-
-// Never destroyed: the server thread waits on them until the process ends.
-std::mutex &mu = *new std::mutex;
-std::condition_variable &cv = *new std::condition_variable;
-bool jobPosted = false, jobDone = false;
-Job job;
-Outcome outcome;
 
 // 1: readable within the bound; 0: not, or the call has returned and nothing is there.
 int waitIn(int fd, int timeoutMs) {
@@ -192,19 +180,22 @@ int connectPeer() {
     return -1;
 }
 
-void serve(const Job &j, Outcome &o) {
+// One call's server: accepts the test's connection, or with `peer` connects to
+// a listening test; follows the script and watches the test close its end.
+Outcome serve(bool peer, const Script &script) {
+    Outcome o;
     int fd = -1;
-    if (j.peer) {
+    if (peer) {
         fd = connectPeer();
     } else if (waitIn(listenFd, kPeerWaitMs) == 1) {
         fd = ::accept4(listenFd, nullptr, nullptr, SOCK_CLOEXEC);
     }
-    if (fd < 0) return;
+    if (fd < 0) return o;
     o.connected = true;
     // The request: a client test's one or two bytes, a listening test's command.
     if (waitIn(fd, kPeerWaitMs) == 1) uipeer::ReadSome(fd, o.request);
     bool sent = false;
-    for (const Step &st : j.script.steps) {
+    for (const Step &st : script.steps) {
         if (st.op == Step::Send) {
             uipeer::SendAll(fd, st.bytes);
             sent = true;
@@ -214,7 +205,7 @@ void serve(const Job &j, Outcome &o) {
             break;
         }
     }
-    if (!j.script.holds) ::shutdown(fd, SHUT_WR);
+    if (!script.holds) ::shutdown(fd, SHUT_WR);
     // Until the test closes its end: it must, once the call has returned.
     const int64_t deadline = nowMs() + kPeerWaitMs;
     for (;;) {
@@ -229,24 +220,7 @@ void serve(const Job &j, Outcome &o) {
         (sent ? o.after : o.request) += got;
     }
     ::close(fd);
-}
-
-void serverThread() {
-    for (;;) {
-        Job j;
-        {
-            std::unique_lock lk(mu);
-            cv.wait(lk, [] { return jobPosted; });
-            jobPosted = false;
-            j = job;
-        }
-        Outcome o;
-        serve(j, o);
-        std::lock_guard lk(mu);
-        outcome = std::move(o);
-        jobDone = true;
-        cv.notify_all();
-    }
+    return o;
 }
 
 uint16_t boundPort(int fd) {
@@ -291,7 +265,6 @@ extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     listenPort = uipeer::FreePort();  // for the listening tests: free now, and only they bind it
     if (::pipe2(wakePipe, O_CLOEXEC) != 0) fail("no pipe");
     MAA_SetResultWriter(&maarec::Capture);
-    std::thread(serverThread).detach();
     return 0;
 }
 
@@ -313,13 +286,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     MAA_PanelSetWaits(kLongWaitMs, kLongWaitMs, script.holds ? kShortWaitMs : kLongWaitMs);
 
     const int fdBefore = lowestFreeFd();
-    if (!nobody) {
-        std::lock_guard lk(mu);
-        job = {listening, script};
-        jobPosted = true;
-        jobDone = false;
-        cv.notify_all();
-    }
+    std::promise<Outcome> served;
+    std::future<Outcome> outcome = served.get_future();
+    std::thread server;
+    if (!nobody) server = std::thread([&] { served.set_value(serve(listening, script)); });
     IsDisconnected = pulled ? 1 : 0;
     maarec::written.clear();
     stMAASysResult = {};
@@ -329,11 +299,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     if (!nobody) {
         char c = 'r';
         if (::write(wakePipe[1], &c, 1) != 1) fail("wake pipe");
-        std::unique_lock lk(mu);
-        if (!cv.wait_for(lk, std::chrono::milliseconds(3 * kPeerWaitMs), [] { return jobDone; }))
+        if (outcome.wait_for(std::chrono::milliseconds(3 * kPeerWaitMs)) != std::future_status::ready)
             fail("the server thread did not finish (hang)");
-        o = outcome;
-        lk.unlock();
+        o = outcome.get();
+        server.join();
         while (::read(wakePipe[0], &c, 1) != 1) {
         }
     }
