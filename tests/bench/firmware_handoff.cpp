@@ -23,23 +23,11 @@
 #include "FwPack.h"
 #include "RatioReporter.h"
 #include "UpdateManagerSim.h"
-#include "common/ByteOrder.h"
 #include "firmware/FirmWareUpdate.h"
+#include "support/RandomBytes.h"
 #include "vdev.h"
 
 namespace {
-
-std::string Image(size_t n) {
-    std::string s(n, '\0');
-    unsigned x = 7;
-    for (char &c : s) {
-        x = x * 1103515245u + 12345u;
-        c = static_cast<char>(x >> 23);
-    }
-    return s;
-}
-
-std::string Header(uint32_t size) { return fwpack::Header("E7", size); }
 
 // Standard output is where the library marks each block sent.
 class MutedStdout {
@@ -63,7 +51,7 @@ private:
 
 void BM_FirmwareHandoff(benchmark::State &state) {
     const size_t size = static_cast<size_t>(state.range(0));
-    const std::string body = Image(size), header = Header(static_cast<uint32_t>(size));
+    const std::string body = RandomBytes(size, 7), header = fwpack::Header("E7", static_cast<uint32_t>(size));
     peers::UpdateManagerSim manager;
     peers::UmOptions o;
     std::string error;
@@ -152,7 +140,7 @@ private:
 // Baseline: the same bytes over loopback TCP in 64 KiB writes.
 void BM_LoopbackTcp(benchmark::State &state) {
     const size_t size = static_cast<size_t>(state.range(0));
-    const std::string body = Image(size);
+    const std::string body = RandomBytes(size, 7);
     TcpSink sink(size);
     for (auto _ : state) {
         int s = sink.Connect();
@@ -169,7 +157,7 @@ BENCHMARK(BM_LoopbackTcp)->Arg(1 << 20)->Arg(16 << 20)->Unit(benchmark::kMillise
 // dialogue: what is left between this and the hand-off is the library's own.
 void BM_ChannelFileTcp(benchmark::State &state) {
     const size_t size = static_cast<size_t>(state.range(0));
-    const std::string body = Image(size);
+    const std::string body = RandomBytes(size, 7);
     TcpSink sink(size);
     vdev::Reset();
     int fd = ::open(vdev::kPrn, O_RDWR);
