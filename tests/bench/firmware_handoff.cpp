@@ -6,9 +6,7 @@
 // fw.bin and sent on; the manager is the update-manager simulator, which
 // reads and checksums every byte and keeps nothing on disk. A run whose images
 // did not all arrive whole and verified reports an error, not a rate.
-#include <arpa/inet.h>
 #include <fcntl.h>
-#include <netinet/in.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -24,6 +22,7 @@
 #include "RatioReporter.h"
 #include "UpdateManagerSim.h"
 #include "firmware/FirmWareUpdate.h"
+#include "fuzz/Loopback.h"
 #include "support/RandomBytes.h"
 #include "vdev.h"
 
@@ -91,13 +90,7 @@ BENCHMARK(BM_FirmwareHandoff)->Arg(1 << 20)->Arg(16 << 20)->Unit(benchmark::kMil
 class TcpSink {
 public:
     explicit TcpSink(size_t size) {
-        listen_ = ::socket(AF_INET, SOCK_STREAM, 0);
-        addr_.sin_family = AF_INET;
-        addr_.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        socklen_t len = sizeof addr_;
-        ::bind(listen_, reinterpret_cast<sockaddr *>(&addr_), sizeof addr_);
-        ::listen(listen_, 4);
-        ::getsockname(listen_, reinterpret_cast<sockaddr *>(&addr_), &len);
+        listen_ = LoopbackSocket(4, &port_);
         thread_ = std::thread([this, size] {
             std::string buf(1 << 16, '\0');
             for (;;) {
@@ -120,11 +113,7 @@ public:
         thread_.join();
         ::close(listen_);
     }
-    int Connect() const {
-        int s = ::socket(AF_INET, SOCK_STREAM, 0);
-        ::connect(s, reinterpret_cast<const sockaddr *>(&addr_), sizeof addr_);
-        return s;
-    }
+    int Connect() const { return LoopbackConnect(port_); }
     static void Ack(int s) {
         char ack;
         ::recv(s, &ack, 1, 0);
@@ -133,7 +122,7 @@ public:
 
 private:
     int listen_;
-    sockaddr_in addr_{};
+    uint16_t port_ = 0;
     std::thread thread_;
 };
 

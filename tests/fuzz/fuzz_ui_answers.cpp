@@ -16,9 +16,7 @@
 // are well-formed (one header, then at most one verdict), no connection is left
 // open, no descriptor is left behind, a server that answers gets a verdict, and
 // a listening test acknowledges exactly the answer it passes.
-#include <arpa/inet.h>
 #include <fcntl.h>
-#include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -39,6 +37,7 @@
 #include <vector>
 
 #include "FuzzCheck.h"
+#include "Loopback.h"
 #include "adapter/USB.h"
 #include "maa/MAA_IF.h"
 #include "maa/MAA_Result.h"
@@ -136,7 +135,7 @@ int64_t nowMs() {
 }
 
 uint16_t serverPort, listenPort, deadPort;
-int listenFd = -1, deadFd = -1;
+int listenFd = -1;
 int wakePipe[2] = {-1, -1};  // readable once the call under test has returned
 
 struct Outcome {
@@ -164,15 +163,8 @@ int waitIn(int fd, int timeoutMs) {
 
 // Connects to a listening test, retrying until it listens or has returned.
 int connectPeer() {
-    sockaddr_in sa{};
-    sa.sin_family = AF_INET;
-    sa.sin_port = htons(listenPort);
-    sa.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     for (const int64_t deadline = nowMs() + kPeerWaitMs; nowMs() < deadline;) {
-        const int fd = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        if (fd < 0) return -1;
-        if (::connect(fd, reinterpret_cast<sockaddr *>(&sa), sizeof sa) == 0) return fd;
-        ::close(fd);
+        if (const int fd = LoopbackConnect(listenPort); fd >= 0) return fd;
         pollfd p{wakePipe[0], POLLIN, 0};
         if (::poll(&p, 1, 0) > 0) return -1;
         std::this_thread::sleep_for(std::chrono::microseconds(100));
@@ -223,25 +215,6 @@ Outcome serve(bool peer, const Script &script) {
     return o;
 }
 
-uint16_t boundPort(int fd) {
-    sockaddr_in sa{};
-    socklen_t len = sizeof sa;
-    return ::getsockname(fd, reinterpret_cast<sockaddr *>(&sa), &len) == 0 ? ntohs(sa.sin_port) : 0;
-}
-
-// A loopback socket on a free port: listening, or only bound (connections refused).
-int loopbackSocket(bool listening) {
-    const int fd = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_in sa{};
-    sa.sin_family = AF_INET;
-    sa.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    if (fd < 0 || ::bind(fd, reinterpret_cast<sockaddr *>(&sa), sizeof sa) != 0 ||
-        (listening && ::listen(fd, 8) != 0)) {
-        fail("no loopback socket");
-    }
-    return fd;
-}
-
 int lowestFreeFd() {
     const int fd = ::dup(0);
     ::close(fd);
@@ -258,10 +231,8 @@ extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     static TempRoot root;
     std::filesystem::create_directories(root / "/root/Halvard/osgi");
     std::ofstream(root / "/root/Halvard/osgi/socketAddress.prop") << "127.0.0.1";
-    listenFd = loopbackSocket(true);
-    deadFd = loopbackSocket(false);
-    serverPort = boundPort(listenFd);
-    deadPort = boundPort(deadFd);
+    listenFd = LoopbackSocket(8, &serverPort);
+    if (listenFd < 0 || LoopbackSocket(0, &deadPort) < 0) fail("no loopback socket");
     listenPort = uipeer::FreePort();  // for the listening tests: free now, and only they bind it
     if (::pipe2(wakePipe, O_CLOEXEC) != 0) fail("no pipe");
     MAA_SetResultWriter(&maarec::Capture);
