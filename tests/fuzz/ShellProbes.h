@@ -1,7 +1,8 @@
 // Harmless test-shell functions for the fuzz targets: every arity, every
 // result kind, a scanner-side function, text arguments read through the
 // address map, data cells, an undefined symbol and the general function; and
-// for the session targets a download echo and Dump_File over a private root.
+// for the session targets the download echoed or forwarded, and Dump_File
+// over a private root.
 #pragma once
 
 #include <algorithm>
@@ -66,6 +67,13 @@ inline TMAAResult *echoDownload() {
     MAA_IF_FileEnd();
     return done(MAA_RESULT_END);
 }
+// The host's last download taken as ready-made frames (first 8 KiB).
+inline TMAAResult *forwardDownload() {
+    U32 size = 0;
+    U8 *p = MAA_DownloadBuffer(&size);
+    if (p) MAA_WriteFileForward(p, std::min<U32>(size, 8 * 1024));
+    return done(MAA_RESULT_NONE);
+}
 // A private USBADAPTER_ROOT for Dump_File, with a short text at "/t" (once).
 inline void MakeShellFiles() {
     static TempRoot root;
@@ -76,6 +84,7 @@ inline void MakeShellFiles() {
 }
 inline void AddFileFunctions() {
     MAA_SymbolAdd(ftarget_ppc, "dl", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<echoDownload>(), 0);
+    MAA_SymbolAdd(ftarget_ppc, "fw", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<forwardDownload>(), 0);
     MAA_SymbolAdd(ftarget_ppc, "Dump_File", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<Dump_File>(), 1);
 }
 

@@ -2,7 +2,8 @@
 // the rest on the emulated print node with instant time-outs): the start
 // command, lines, the special commands (downloads, saved-command modes), the
 // stop and the auto run behind it, and cable pulls at any point. The shell has
-// the probe functions, a download echo (T2H) and Dump_File (a short text "/t").
+// the probe functions, the download echoed (T2H) or forwarded as frames, and
+// Dump_File (a short text "/t").
 //
 // Input: the host's traffic, in which
 //   FE FF  ends a host transfer,

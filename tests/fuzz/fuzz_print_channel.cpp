@@ -161,23 +161,6 @@ S32 NotifyAppEnd(const char *type) {
 
 const TPrintDelivery kJava = {RegisterJob, PassData, NotifyEndOfData, SendAppType, SendAppBuf, NotifyAppEnd};
 
-// ---- the test shell's functions --------------------------------------------
-
-// The host's last download taken as ready-made frames (first 8 KiB).
-TMAAResult *forwardDownload() {
-    U32 size = 0;
-    U8 *p = MAA_DownloadBuffer(&size);
-    if (p) MAA_WriteFileForward(p, std::min<U32>(size, 8 * 1024));
-    return probes::done(MAA_RESULT_NONE);
-}
-
-void registerSymbols() {
-    probes::Register([] {
-        probes::AddFileFunctions();
-        MAA_SymbolAdd(ftarget_ppc, "fw", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<forwardDownload>(), 0);
-    });
-}
-
 // ---- the host --------------------------------------------------------------
 
 // Shared with the watcher: the phases still to send and the turn in progress.
@@ -287,7 +270,7 @@ void setUp() {
 
     probes::ResetSession();
     std::memset(aubBuf, 0, sizeof aubBuf);
-    registerSymbols();
+    probes::Register(probes::AddFileFunctions);
 }
 
 size_t count(std::string_view hay, std::string_view needle) {
@@ -359,9 +342,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     for (const Phase &p : parsed) transfers += p.size();
     {
         std::lock_guard lk(hostMu);
-        phases = std::move(parsed);
-        nextPhase = 0;
-        pulled = false;
+        phases = std::move(parsed);  // cleanUp() has rewound the host
         sendNextPhase();
     }
 
