@@ -20,10 +20,8 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cstddef>
 #include <cstdint>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <string>
@@ -34,12 +32,9 @@
 #include "HostTraffic.h"
 #include "adapter/USB.h"
 #include "common/Wait.h"
-#include "maa/MAA_Address.h"
 #include "maa/MAA_Hook.h"
 #include "maa/MAA_IF.h"
 #include "maa/MAA_MM.h"
-#include "maa/MAA_Result.h"
-#include "maa/MAA_Symbol.h"
 #include "ShellProbes.h"
 #include "vdev.h"
 

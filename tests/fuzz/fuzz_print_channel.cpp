@@ -23,7 +23,6 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstddef>
@@ -43,12 +42,7 @@
 #include "adapter/USB.h"
 #include "adapter/prn_thread.h"
 #include "common/Wait.h"
-#include "maa/MAA_Address.h"
 #include "maa/MAA_Hook.h"
-#include "maa/MAA_IF.h"
-#include "maa/MAA_MM.h"
-#include "maa/MAA_Result.h"
-#include "maa/MAA_Symbol.h"
 #include "ShellProbes.h"
 #include "print/USBPrint.h"
 #include "vdev.h"

@@ -18,8 +18,6 @@
 #include <cstdlib>
 #include <cstring>
 #include <string>
-#include <string_view>
-#include <vector>
 
 #include "FuzzCheck.h"
 #include "HostTraffic.h"
