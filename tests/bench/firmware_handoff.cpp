@@ -6,16 +6,13 @@
 // fw.bin and sent on; the manager is the update-manager simulator, which
 // reads and checksums every byte and keeps nothing on disk. A run whose images
 // did not all arrive whole and verified reports an error, not a rate.
-#include <arpa/inet.h>
 #include <fcntl.h>
-#include <netinet/in.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
 #include <benchmark/benchmark.h>
 
 #include <cstdlib>
-#include <cstring>
 #include <filesystem>
 #include <string>
 #include <thread>
@@ -23,23 +20,12 @@
 #include "FwPack.h"
 #include "RatioReporter.h"
 #include "UpdateManagerSim.h"
-#include "common/ByteOrder.h"
 #include "firmware/FirmWareUpdate.h"
+#include "fuzz/Loopback.h"
+#include "support/RandomBytes.h"
 #include "vdev.h"
 
 namespace {
-
-std::string Image(size_t n) {
-    std::string s(n, '\0');
-    unsigned x = 7;
-    for (char &c : s) {
-        x = x * 1103515245u + 12345u;
-        c = static_cast<char>(x >> 23);
-    }
-    return s;
-}
-
-std::string Header(uint32_t size) { return fwpack::Header("E7", size); }
 
 // Standard output is where the library marks each block sent.
 class MutedStdout {
@@ -63,7 +49,7 @@ private:
 
 void BM_FirmwareHandoff(benchmark::State &state) {
     const size_t size = static_cast<size_t>(state.range(0));
-    const std::string body = Image(size), header = Header(static_cast<uint32_t>(size));
+    const std::string body = RandomBytes(size, 7), header = fwpack::Header("E7", static_cast<uint32_t>(size));
     peers::UpdateManagerSim manager;
     peers::UmOptions o;
     std::string error;
@@ -103,13 +89,7 @@ BENCHMARK(BM_FirmwareHandoff)->Arg(1 << 20)->Arg(16 << 20)->Unit(benchmark::kMil
 class TcpSink {
 public:
     explicit TcpSink(size_t size) {
-        listen_ = ::socket(AF_INET, SOCK_STREAM, 0);
-        addr_.sin_family = AF_INET;
-        addr_.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        socklen_t len = sizeof addr_;
-        ::bind(listen_, reinterpret_cast<sockaddr *>(&addr_), sizeof addr_);
-        ::listen(listen_, 4);
-        ::getsockname(listen_, reinterpret_cast<sockaddr *>(&addr_), &len);
+        listen_ = LoopbackSocket(4, &port_);
         thread_ = std::thread([this, size] {
             std::string buf(1 << 16, '\0');
             for (;;) {
@@ -132,11 +112,7 @@ public:
         thread_.join();
         ::close(listen_);
     }
-    int Connect() const {
-        int s = ::socket(AF_INET, SOCK_STREAM, 0);
-        ::connect(s, reinterpret_cast<const sockaddr *>(&addr_), sizeof addr_);
-        return s;
-    }
+    int Connect() const { return LoopbackConnect(port_); }
     static void Ack(int s) {
         char ack;
         ::recv(s, &ack, 1, 0);
@@ -145,14 +121,14 @@ public:
 
 private:
     int listen_;
-    sockaddr_in addr_{};
+    uint16_t port_ = 0;
     std::thread thread_;
 };
 
 // Baseline: the same bytes over loopback TCP in 64 KiB writes.
 void BM_LoopbackTcp(benchmark::State &state) {
     const size_t size = static_cast<size_t>(state.range(0));
-    const std::string body = Image(size);
+    const std::string body = RandomBytes(size, 7);
     TcpSink sink(size);
     for (auto _ : state) {
         int s = sink.Connect();
@@ -169,7 +145,7 @@ BENCHMARK(BM_LoopbackTcp)->Arg(1 << 20)->Arg(16 << 20)->Unit(benchmark::kMillise
 // dialogue: what is left between this and the hand-off is the library's own.
 void BM_ChannelFileTcp(benchmark::State &state) {
     const size_t size = static_cast<size_t>(state.range(0));
-    const std::string body = Image(size);
+    const std::string body = RandomBytes(size, 7);
     TcpSink sink(size);
     vdev::Reset();
     int fd = ::open(vdev::kPrn, O_RDWR);

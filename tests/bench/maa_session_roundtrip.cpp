@@ -8,16 +8,15 @@
 
 #include <atomic>
 #include <cstdlib>
-#include <cstring>
 #include <string>
 #include <thread>
 
 #include "RatioReporter.h"
 #include "adapter/USB.h"
-#include "common/ByteOrder.h"
 #include "maa/MAA_Address.h"
 #include "maa/MAA_Hook.h"
 #include "maa/MAA_Symbol.h"
+#include "support/MaaRecords.h"
 #include "vdev.h"
 #include "vendor/VLX_Main.h"
 
@@ -34,14 +33,6 @@ TMAAResult stResult;
 TMAAResult *probe(U32) {
     stResult = {MAA_RESULT_END, 1, 16, aubText};
     return &stResult;
-}
-
-std::string Special(U8 op, U32 size) {
-    std::string s = "#$%";
-    s += static_cast<char>(op);
-    s.resize(8);
-    WriteBE32(reinterpret_cast<U8 *>(s.data() + 4), size);
-    return s + "\r";
 }
 
 void Expect(size_t bytes, benchmark::State &state) {
@@ -123,10 +114,8 @@ BENCHMARK(BM_RoundTrip_Shell)->UseRealTime();
 // record proves the device has taken the whole file), then the stop.
 void Download(benchmark::State &state, bool shell) {
     const size_t size = static_cast<size_t>(state.range(0));
-    const std::string head = Special(MAA_FILE_TRANS_H2T, static_cast<U32>(size));
-    std::string file(size, '\0');
-    for (size_t i = 0; i < size; ++i) file[i] = static_cast<char>(i * 13);
-    const std::string transfer = kStart + head + file + kLine + kStop;
+    const std::string head = maarec::Special(MAA_FILE_TRANS_H2T, static_cast<U32>(size));
+    const std::string transfer = kStart + head + maarec::Pattern(size) + kLine + kStop;
     const size_t answer = kAckBytes + 4 + kRecordBytes + kAckBytes;
     Device device(shell, transfer.size(), answer);
     for (auto _ : state) {

@@ -16,19 +16,18 @@
 #include <cstdlib>
 #include <fstream>
 #include <string>
-#include <vector>
 
 #include "adapter/USB.h"
 #include "adapter/prn_thread.h"
 #include "common/Wait.h"
 #include "print/USBPrint.h"
+#include "support/RandomBytes.h"
+#include "support/Uel.h"
 #include "vdev.h"
 
 namespace {
 
 constexpr size_t kTransfer = 1 << 20;
-const std::string kUel = "\x1b%-12345X";
-
 struct Seen {
     int jobs = 0, ended = 0;
     uint64_t bytes = 0, sum = 0;
@@ -79,13 +78,8 @@ int main() {
     vdev::SetInstantTimeouts(vdev::kPrn, true);
 
     // The body: bytes without ESC, so the job ends only at its closing UEL.
-    std::vector<char> body(kTransfer);
-    uint32_t x = 1;
-    for (char &c : body) {
-        x = x * 1103515245u + 12345u;
-        c = static_cast<char>(x >> 24);
-        if (c == '\x1b') c = 'E';
-    }
+    std::string body = RandomBytes(kTransfer, 1);
+    std::replace(body.begin(), body.end(), '\x1b', 'E');
     uint64_t want = 0;
     auto sum = [&want](const char *p, size_t n) {
         for (size_t i = 0; i < n; ++i) want = want * 31 + static_cast<unsigned char>(p[i]);
@@ -97,7 +91,7 @@ int main() {
     Drain();
     long first = -1, low = 0, high = 0;
     for (uint64_t i = 1; i <= mib; ++i) {
-        vdev::HostWrite(vdev::kPrn, body.data(), body.size());
+        vdev::HostWrite(vdev::kPrn, body);
         sum(body.data(), body.size());
         Drain();
         if (i == 64 || (i > 64 && i % 128 == 0) || i == mib) {

@@ -14,24 +14,24 @@
 #include <benchmark/benchmark.h>
 #include <fcntl.h>
 #include <poll.h>
-#include <sys/ipc.h>
-#include <sys/msg.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
-#include <filesystem>
 #include <string>
 #include <thread>
 #include <vector>
 
-#include "Data.h"
 #include "Host.h"
 #include "Jvm.h"
 #include "LoggerHost.h"
 #include "RatioReporter.h"
+#include "support/MsgQueue.h"
+#include "support/RandomBytes.h"
+#include "support/Uel.h"
 #include "vdev.h"
 
 namespace {
@@ -41,7 +41,7 @@ constexpr size_t kReadSize = 1 << 20;  // the reader's RX_BUFFER_SIZE
 constexpr const char *kDaemon = "com/tarnwel/vbk/ca/plugin/usbadapter/print/USBPrintDaemon";
 constexpr const char *kMaa = "com/tarnwel/vbk/ca/plugin/usbadapter/print/USBMaaService";
 
-std::string gRoot;
+TempRoot *gRoot;  // removed by hand: the process ends with _exit
 sim::ServiceThread gReader;
 sim::ServiceThread gBare;
 jobject gDaemon;
@@ -53,24 +53,10 @@ std::string gJob;
     _exit(1);
 }
 
-void RemoveQueues() {
-    for (int project : {5, 6}) {
-        key_t key = ftok((gRoot + "/halvard/spool/tmp/testfile").c_str(), project);
-        int q = key == -1 ? -1 : msgget(key, 0);
-        if (q >= 0) msgctl(q, IPC_RMID, nullptr);
-    }
-}
-
 // The service's start-up on the plain print daemon, then the host configures
 // the device; returns when the reader polls the print node.
 void StartService() {
-    char tmpl[] = "/tmp/usbadapter-bench-XXXXXX";
-    if (!::mkdtemp(tmpl)) Fail("no temporary directory");
-    gRoot = tmpl;
-    std::filesystem::create_directories(gRoot + "/halvard/sys/statusinfo");
-    std::filesystem::create_directories(gRoot + "/halvard/spool/tmp");
-    ::setenv("USBADAPTER_ROOT", gRoot.c_str(), 1);
-
+    gRoot = new TempRoot;
     sim::JvmConfig config = sim::DefaultJvmConfig();
     config.checkJni = false;
     config.maxHeap = "1g";
@@ -158,17 +144,12 @@ bool Drained(const char *path, pid_t tid) {
     return vdev::PendingHostBytes(path) == 0 && sim::ProbeThread(tid) == sim::ThreadWait::Poll;
 }
 
+// PCL without ESC, framed: the job ends only at its closing UEL.
 std::string MakeJob() {
-    const std::string head = std::string(sim::kUel) + "@PJL ENTER LANGUAGE=PCL\r\n";
-    std::string job = head;
-    unsigned x = 7;
-    job.reserve(kJobSize);
-    while (job.size() < kJobSize - sim::kUel.size()) {
-        x = x * 1103515245u + 12345u;
-        char c = static_cast<char>(x >> 23);
-        job.push_back(c == '\x1b' ? 'E' : c);
-    }
-    return job + std::string(sim::kUel);
+    const std::string pjl = "@PJL ENTER LANGUAGE=PCL\r\n";
+    std::string body = RandomBytes(kJobSize - pjl.size() - 2 * kUel.size(), 7);
+    std::replace(body.begin(), body.end(), '\x1b', 'E');
+    return Framed(pjl + body);
 }
 
 // Host writes of the job in transfers of `size`; returns when `done` holds,
@@ -190,7 +171,7 @@ double SendJob(const char *path, size_t size, Done done) {
 // chunk passed and nothing was refused. Otherwise the figures would measure a
 // path that drops the data.
 void CheckPrintPath() {
-    const std::string job = std::string(sim::kUel) + "@PJL ENTER LANGUAGE=PCL\r\nsanity" + std::string(sim::kUel);
+    const std::string job = Framed("@PJL ENTER LANGUAGE=PCL\r\nsanity");
     const pid_t reader = gReader.tid;
     LoggerHost_StartCapture();
     vdev::HostWrite(vdev::kPrn, job.data(), job.size());
@@ -259,9 +240,8 @@ int main(int argc, char **argv) {
     benchmark::RunSpecifiedBenchmarks(&reporter);
     reporter.PrintRatios();
     benchmark::Shutdown();
-    RemoveQueues();
-    std::error_code ec;
-    std::filesystem::remove_all(gRoot, ec);
+    RemoveQueues(*gRoot);
+    delete gRoot;
     std::fflush(nullptr);
     _exit(0);  // the print reader never returns
 }

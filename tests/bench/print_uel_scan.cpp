@@ -5,6 +5,7 @@
 // a UEL at the very end.
 #include <benchmark/benchmark.h>
 
+#include <algorithm>
 #include <cstdlib>
 #include <cstring>
 #include <string>
@@ -12,6 +13,7 @@
 #include "RatioReporter.h"
 #include "adapter/Classifier.h"
 #include "adapter/prn_thread.h"
+#include "support/RandomBytes.h"
 
 namespace {
 
@@ -19,13 +21,8 @@ constexpr size_t kSize = 1 << 20;
 const char *const kKinds[] = {"plain", "pcl", "uel-at-end"};
 
 std::string MakeBuffer(int kind) {
-    std::string b(kSize, '\0');
-    unsigned x = 12345;
-    for (char &c : b) {
-        x = x * 1103515245u + 12345u;
-        c = static_cast<char>(x >> 23);
-        if (c == '\x1b') c = 'E';
-    }
+    std::string b = RandomBytes(kSize, 12345);
+    std::replace(b.begin(), b.end(), '\x1b', 'E');
     if (kind == 1) {
         for (size_t i = 0; i + 8 < kSize; i += 64) std::memcpy(&b[i], "\x1b*b64W", 6);  // raster row command
     } else if (kind == 2) {

@@ -9,9 +9,7 @@
 //   is sent when the library connects and waits until it reads it.
 // Checked: the call returns within a bound, with -1, 0 or a count of at most
 // 80 bytes; it never leaves a connection or descriptor open.
-#include <arpa/inet.h>
 #include <fcntl.h>
-#include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -28,21 +26,13 @@
 #include <vector>
 
 #include "FuzzCheck.h"
+#include "HostTraffic.h"
+#include "Loopback.h"
 #include "firmware/FirmWareUpdate.h"
 #include "firmware/UpdateManager.h"
 #include "vdev.h"
 
 namespace {
-
-std::vector<std::string> Split(std::string_view s, std::string_view sep) {
-    std::vector<std::string> out;
-    for (;;) {
-        size_t at = s.find(sep);
-        out.emplace_back(s.substr(0, at));
-        if (at == std::string_view::npos) return out;
-        s.remove_prefix(at + sep.size());
-    }
-}
 
 int g_listen = -1;
 int g_wake[2] = {-1, -1};  // readable once the download has returned
@@ -51,15 +41,9 @@ void Setup() {
     // fw.bin lands in the working directory; libFuzzer's paths are relative
     // to it, so it stays as it is.
     ::setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
-    g_listen = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_in a{};
-    a.sin_family = AF_INET;
-    a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    socklen_t len = sizeof a;
-    if (::bind(g_listen, reinterpret_cast<sockaddr *>(&a), sizeof a) != 0 || ::listen(g_listen, 64) != 0 ||
-        ::getsockname(g_listen, reinterpret_cast<sockaddr *>(&a), &len) != 0)
-        fail("cannot listen");
-    ::setenv(UPDATE_PORT_ENV, std::to_string(ntohs(a.sin_port)).c_str(), 1);
+    uint16_t port = 0;
+    if ((g_listen = LoopbackSocket(64, &port)) < 0) fail("cannot listen");
+    ::setenv(UPDATE_PORT_ENV, std::to_string(port).c_str(), 1);
     UpdateManager_SetWaitMs(2);
     if (::pipe2(g_wake, O_CLOEXEC) != 0) fail("no pipe");
     // The marks on standard output are not the fuzzer's business.

@@ -2,7 +2,8 @@
 // the rest on the emulated print node with instant time-outs): the start
 // command, lines, the special commands (downloads, saved-command modes), the
 // stop and the auto run behind it, and cable pulls at any point. The shell has
-// the probe functions, a download echo (T2H) and Dump_File (a short text "/t").
+// the probe functions, the download echoed (T2H) or forwarded as frames, and
+// Dump_File (a short text "/t").
 //
 // Input: the host's traffic, in which
 //   FE FF  ends a host transfer,
@@ -19,10 +20,8 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cstddef>
 #include <cstdint>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <string>
@@ -30,16 +29,13 @@
 #include <vector>
 
 #include "FuzzCheck.h"
+#include "HostTraffic.h"
 #include "adapter/USB.h"
 #include "common/Wait.h"
-#include "maa/MAA_Address.h"
 #include "maa/MAA_Hook.h"
 #include "maa/MAA_IF.h"
 #include "maa/MAA_MM.h"
-#include "maa/MAA_Result.h"
-#include "maa/MAA_Symbol.h"
 #include "ShellProbes.h"
-#include "support/TempRoot.h"
 #include "vdev.h"
 
 namespace {
@@ -48,8 +44,6 @@ namespace {
 // waiting, and polls after a pull before the session counts as hung.
 constexpr int kIdlePolls = 2;
 constexpr int kPollsAfterPull = 1000;
-
-using Phase = std::vector<std::string>;
 
 // The session under way: its phases still to send, and the host's patience.
 std::vector<Phase> phases;
@@ -89,46 +83,6 @@ void onPoll() {
     }
 }
 
-// The host's last download, sent back as a file (first 64 KiB).
-TMAAResult *echoDownload() {
-    U32 size = 0;
-    const U8 *p = MAA_DownloadBuffer(&size);
-    MAA_IF_WriteFile(p, p ? std::min<U32>(size, 64 * 1024) : 0);
-    MAA_IF_FileEnd();
-    return probes::done(MAA_RESULT_END);
-}
-
-void registerSymbols() {
-    probes::Register([] {
-        MAA_SymbolAdd(ftarget_ppc, "dl", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<echoDownload>(), 0);
-        MAA_SymbolAdd(ftarget_ppc, "Dump_File", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<Dump_File>(), 1);
-    });
-}
-
-// Splits one session's traffic into phases of transfers.
-std::vector<Phase> parsePhases(std::string_view d, std::string &all) {
-    std::vector<Phase> out(1);
-    std::string cur;
-    auto push = [&](bool evenEmpty) {
-        if (cur.empty() && !evenEmpty) return;
-        all += cur;
-        out.back().push_back(std::move(cur));
-        cur.clear();
-    };
-    for (size_t i = 0; i < d.size(); ++i) {
-        if (static_cast<U8>(d[i]) == 0xFE && i + 1 < d.size() &&
-            (static_cast<U8>(d[i + 1]) == 0xFF || static_cast<U8>(d[i + 1]) == 0xFE)) {
-            push(static_cast<U8>(d[i + 1]) == 0xFF);
-            if (static_cast<U8>(d[i + 1]) == 0xFE) out.emplace_back();
-            ++i;
-            continue;
-        }
-        cur.push_back(d[i]);
-    }
-    push(false);
-    return out;
-}
-
 bool startsWith(const std::vector<uint8_t> &w, std::string_view p) {
     return w.size() >= p.size() && std::memcmp(w.data(), p.data(), p.size()) == 0;
 }
@@ -150,7 +104,7 @@ void openNode() {
 void runSession(std::string_view traffic) {
     openNode();
     std::string host;
-    phases = parsePhases(traffic, host);
+    phases = SplitPhases(traffic, host);
     // The start command is read up to the first empty transfer (a time-out).
     const std::string beforeEmpty = [] {
         std::string bytes;
@@ -220,30 +174,16 @@ extern "C" int __wrap__Z11Wait_PollIniiPsPFbvEi(int fd, int timeoutMs, short *re
 
 extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
-    static TempRoot root;
-    if (FILE *f = std::fopen((root / "/t").c_str(), "w")) {
-        std::fputs("first line\nsecond line\n\nafter the empty line\n", f);
-        std::fclose(f);
-    }
+    probes::MakeShellFiles();
     return 0;
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
-    registerSymbols();
-    fSellStop = 0;
-    ulReadCount = 0;
-    dataReadCount = 0;
-
+    probes::Register(probes::AddFileFunctions);
+    probes::ResetSession();
     // Sessions between cable pulls.
-    const std::string_view all(reinterpret_cast<const char *>(data), size);
-    for (size_t from = 0; from <= all.size();) {
-        size_t cut = from;
-        while (cut + 1 < all.size() && !(static_cast<U8>(all[cut]) == 0xFE && static_cast<U8>(all[cut + 1]) == 0xFD))
-            ++cut;
-        if (cut + 1 >= all.size()) cut = all.size();
-        runSession(all.substr(from, cut - from));
-        from = cut + 2;
-    }
+    for (const std::string &session : Split({reinterpret_cast<const char *>(data), size}, "\xFE\xFD"))
+        runSession(session);
 
     ::close(fdPrn);
     fdPrn = 0;

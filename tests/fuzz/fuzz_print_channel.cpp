@@ -23,7 +23,6 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstddef>
@@ -38,19 +37,14 @@
 #include <vector>
 
 #include "FuzzCheck.h"
+#include "HostTraffic.h"
 #include "adapter/Classifier.h"
 #include "adapter/USB.h"
 #include "adapter/prn_thread.h"
 #include "common/Wait.h"
-#include "maa/MAA_Address.h"
 #include "maa/MAA_Hook.h"
-#include "maa/MAA_IF.h"
-#include "maa/MAA_MM.h"
-#include "maa/MAA_Result.h"
-#include "maa/MAA_Symbol.h"
 #include "ShellProbes.h"
 #include "print/USBPrint.h"
-#include "support/TempRoot.h"
 #include "vdev.h"
 
 namespace {
@@ -161,35 +155,7 @@ S32 NotifyAppEnd(const char *type) {
 
 const TPrintDelivery kJava = {RegisterJob, PassData, NotifyEndOfData, SendAppType, SendAppBuf, NotifyAppEnd};
 
-// ---- the test shell's functions --------------------------------------------
-
-// The host's last download, sent back as a file (first 64 KiB).
-TMAAResult *echoDownload() {
-    U32 size = 0;
-    const U8 *p = MAA_DownloadBuffer(&size);
-    MAA_IF_WriteFile(p, p ? std::min<U32>(size, 64 * 1024) : 0);
-    MAA_IF_FileEnd();
-    return probes::done(MAA_RESULT_END);
-}
-// The host's last download taken as ready-made frames (first 8 KiB).
-TMAAResult *forwardDownload() {
-    U32 size = 0;
-    U8 *p = MAA_DownloadBuffer(&size);
-    if (p) MAA_WriteFileForward(p, std::min<U32>(size, 8 * 1024));
-    return probes::done(MAA_RESULT_NONE);
-}
-
-void registerSymbols() {
-    probes::Register([] {
-        MAA_SymbolAdd(ftarget_ppc, "dl", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<echoDownload>(), 0);
-        MAA_SymbolAdd(ftarget_ppc, "fw", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<forwardDownload>(), 0);
-        MAA_SymbolAdd(ftarget_ppc, "Dump_File", MAA_SYM_FUNC_HIDE, MAA_FuncEntry<Dump_File>(), 1);
-    });
-}
-
 // ---- the host --------------------------------------------------------------
-
-using Phase = std::vector<std::string>;
 
 // Shared with the watcher: the phases still to send and the turn in progress.
 std::mutex hostMu;
@@ -296,43 +262,10 @@ void setUp() {
     restData = 0;
     dataEnd = 0;
 
-    maa_session::slPollTimeout = MAA_POLL_TIMEOUT_FIRST;
-    enSpecialMode = MAA_NORMAL_CMD;
-    fSellStop = 0;
-    ulReadCount = 0;
-    dataReadCount = 0;
+    probes::ResetSession();
     std::memset(aubBuf, 0, sizeof aubBuf);
-    registerSymbols();
+    probes::Register(probes::AddFileFunctions);
 }
-
-// Splits the traffic into phases of transfers; returns every host byte in order.
-std::string parse(const uint8_t *d, size_t n, std::vector<Phase> &out, size_t &transfers) {
-    std::string all, cur;
-    out.assign(1, {});
-    transfers = 0;
-    // A transfer separator always ends a transfer (two in a row send an empty
-    // one); a phase separator ends one only if it holds bytes.
-    auto push = [&](bool evenEmpty) {
-        if (cur.empty() && !evenEmpty) return;
-        all += cur;
-        out.back().push_back(std::move(cur));
-        cur.clear();
-        ++transfers;
-    };
-    for (size_t i = 0; i < n; ++i) {
-        if (d[i] == 0xFE && i + 1 < n && (d[i + 1] == 0xFF || d[i + 1] == 0xFE)) {
-            push(d[i + 1] == 0xFF);
-            if (d[i + 1] == 0xFE) out.emplace_back();
-            ++i;
-            continue;
-        }
-        cur.push_back(static_cast<char>(d[i]));
-    }
-    push(false);
-    return all;
-}
-
-bool contains(std::string_view hay, std::string_view needle) { return hay.find(needle) != std::string_view::npos; }
 
 size_t count(std::string_view hay, std::string_view needle) {
     size_t c = 0;
@@ -352,7 +285,7 @@ bool isSubsequence(std::string_view part, std::string_view whole) {
 
 // Bytes the host sent that ask the device to answer on the print channel.
 bool asksForAnswer(std::string_view host) {
-    if (contains(host, std::string_view("\x1bwMAASTART", 10))) return true;
+    if (host.find(std::string_view("\x1bwMAASTART", 10)) != std::string_view::npos) return true;
     for (size_t p = host.find('\x1b'); p != std::string_view::npos && p + 1 < host.size(); p = host.find('\x1b', p + 1)) {
         switch (static_cast<U8>(host[p + 1])) {
         case 0x24: case 0x91: case 0x9A: case 0xA8: case 0xAA: return true;
@@ -384,12 +317,7 @@ extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     strict = s != nullptr && *s == '1';
     const char *v = std::getenv("FUZZ_PRINT_CHANNEL_VERBOSE");
     verbose = v != nullptr && *v == '1';
-    // The controller's files, for Dump_File: a short text at "/t".
-    static TempRoot root;
-    if (FILE *f = std::fopen((root / "/t").c_str(), "w")) {
-        std::fputs("first line\nsecond line\n\nafter the empty line\n", f);
-        std::fclose(f);
-    }
+    probes::MakeShellFiles();
     USBPrint_SetDelivery(&kJava);
     if (USBAdapter_AllocateReadBuffers() != 1) fail("the reader's buffers cannot be allocated");
     cleanUp();
@@ -402,14 +330,13 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     setUp();
     java.answers = {static_cast<U8>(data[0] & 3), static_cast<U8>((data[0] >> 2) & 7)};
 
-    std::vector<Phase> parsed;
+    std::string host;
+    std::vector<Phase> parsed = SplitPhases({reinterpret_cast<const char *>(data) + 1, size - 1}, host);
     size_t transfers = 0;
-    const std::string host = parse(data + 1, size - 1, parsed, transfers);
+    for (const Phase &p : parsed) transfers += p.size();
     {
         std::lock_guard lk(hostMu);
-        phases = std::move(parsed);
-        nextPhase = 0;
-        pulled = false;
+        phases = std::move(parsed);  // cleanUp() has rewound the host
         sendNextPhase();
     }
 

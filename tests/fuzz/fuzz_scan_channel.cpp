@@ -18,10 +18,9 @@
 #include <cstdlib>
 #include <cstring>
 #include <string>
-#include <string_view>
-#include <vector>
 
 #include "FuzzCheck.h"
+#include "HostTraffic.h"
 #include "adapter/USB.h"
 #include "common/ByteOrder.h"
 #include "print/USBPrint.h"
@@ -123,13 +122,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     CHECK(USBAdpScan_Openfd() == 1, "scan node not opened");
     vdev::SetInstantTimeouts(vdev::kScan, true);
 
-    std::string_view rest(reinterpret_cast<const char *>(data) + 1, size - 1);
-    while (!rest.empty()) {
-        size_t end = rest.find("\xfe\xff");
-        std::string_view t = rest.substr(0, end);
+    for (const std::string &t : Split({reinterpret_cast<const char *>(data) + 1, size - 1}, "\xfe\xff"))
         if (!t.empty()) vdev::HostWrite(vdev::kScan, t.data(), t.size());
-        rest = end == std::string_view::npos ? std::string_view{} : rest.substr(end + 2);
-    }
     // Everything is sent; what waits for more waits for a host that is gone.
     IsDisconnected = 1;
     size_t turns = 0;

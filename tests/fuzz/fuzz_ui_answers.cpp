@@ -16,9 +16,7 @@
 // are well-formed (one header, then at most one verdict), no connection is left
 // open, no descriptor is left behind, a server that answers gets a verdict, and
 // a listening test acknowledges exactly the answer it passes.
-#include <arpa/inet.h>
 #include <fcntl.h>
-#include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -26,25 +24,25 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <mutex>
+#include <future>
 #include <string>
 #include <thread>
 #include <vector>
 
 #include "FuzzCheck.h"
+#include "Loopback.h"
 #include "adapter/USB.h"
 #include "maa/MAA_IF.h"
 #include "maa/MAA_Result.h"
 #include "maa/functions/MAA_Panel.h"
 #include "UiPeer.h"
+#include "support/MaaRecords.h"
 #include "support/TempRoot.h"
 
 namespace {
@@ -88,17 +86,6 @@ const Fn kFns[] = {
     {Kind::Listening, noArg<UISSM_IF_LED_Test>, '2'},
 };
 constexpr size_t kFnCount = sizeof kFns / sizeof kFns[0];
-
-struct Record {
-    U32 status;
-    std::string text;
-};
-Record recordOf(const TMAAResult *r) {
-    return {r->enContinue,
-            std::string(reinterpret_cast<const char *>(r->pubData), r->pubData != nullptr ? r->ulDataSize : 0)};
-}
-std::vector<Record> written;
-void capture(const TMAAResult *r) { written.push_back(recordOf(r)); }
 
 // ---- the server's script ----------------------------------------------------------
 
@@ -147,26 +134,15 @@ int64_t nowMs() {
 }
 
 uint16_t serverPort, listenPort, deadPort;
-int listenFd = -1, deadFd = -1;
+int listenFd = -1;
 int wakePipe[2] = {-1, -1};  // readable once the call under test has returned
 
-struct Job {
-    bool peer = false;  // connect to a listening test instead of accepting
-    Script script;
-};
 struct Outcome {
     bool connected = false;
     bool closedByTest = false;  // the test's end was seen closed
     std::string request;        // what arrived before the first answer
     std::string after;          // what arrived after it
 };
-
-// Never destroyed: the server thread waits on them until the process ends.
-std::mutex &mu = *new std::mutex;
-std::condition_variable &cv = *new std::condition_variable;
-bool jobPosted = false, jobDone = false;
-Job job;
-Outcome outcome;
 
 // 1: readable within the bound; 0: not, or the call has returned and nothing is there.
 int waitIn(int fd, int timeoutMs) {
@@ -186,15 +162,8 @@ int waitIn(int fd, int timeoutMs) {
 
 // Connects to a listening test, retrying until it listens or has returned.
 int connectPeer() {
-    sockaddr_in sa{};
-    sa.sin_family = AF_INET;
-    sa.sin_port = htons(listenPort);
-    sa.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     for (const int64_t deadline = nowMs() + kPeerWaitMs; nowMs() < deadline;) {
-        const int fd = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        if (fd < 0) return -1;
-        if (::connect(fd, reinterpret_cast<sockaddr *>(&sa), sizeof sa) == 0) return fd;
-        ::close(fd);
+        if (const int fd = LoopbackConnect(listenPort); fd >= 0) return fd;
         pollfd p{wakePipe[0], POLLIN, 0};
         if (::poll(&p, 1, 0) > 0) return -1;
         std::this_thread::sleep_for(std::chrono::microseconds(100));
@@ -202,19 +171,22 @@ int connectPeer() {
     return -1;
 }
 
-void serve(const Job &j, Outcome &o) {
+// One call's server: accepts the test's connection, or with `peer` connects to
+// a listening test; follows the script and watches the test close its end.
+Outcome serve(bool peer, const Script &script) {
+    Outcome o;
     int fd = -1;
-    if (j.peer) {
+    if (peer) {
         fd = connectPeer();
     } else if (waitIn(listenFd, kPeerWaitMs) == 1) {
         fd = ::accept4(listenFd, nullptr, nullptr, SOCK_CLOEXEC);
     }
-    if (fd < 0) return;
+    if (fd < 0) return o;
     o.connected = true;
     // The request: a client test's one or two bytes, a listening test's command.
     if (waitIn(fd, kPeerWaitMs) == 1) uipeer::ReadSome(fd, o.request);
     bool sent = false;
-    for (const Step &st : j.script.steps) {
+    for (const Step &st : script.steps) {
         if (st.op == Step::Send) {
             uipeer::SendAll(fd, st.bytes);
             sent = true;
@@ -224,7 +196,7 @@ void serve(const Job &j, Outcome &o) {
             break;
         }
     }
-    if (!j.script.holds) ::shutdown(fd, SHUT_WR);
+    if (!script.holds) ::shutdown(fd, SHUT_WR);
     // Until the test closes its end: it must, once the call has returned.
     const int64_t deadline = nowMs() + kPeerWaitMs;
     for (;;) {
@@ -239,43 +211,7 @@ void serve(const Job &j, Outcome &o) {
         (sent ? o.after : o.request) += got;
     }
     ::close(fd);
-}
-
-void serverThread() {
-    for (;;) {
-        Job j;
-        {
-            std::unique_lock lk(mu);
-            cv.wait(lk, [] { return jobPosted; });
-            jobPosted = false;
-            j = job;
-        }
-        Outcome o;
-        serve(j, o);
-        std::lock_guard lk(mu);
-        outcome = std::move(o);
-        jobDone = true;
-        cv.notify_all();
-    }
-}
-
-uint16_t boundPort(int fd) {
-    sockaddr_in sa{};
-    socklen_t len = sizeof sa;
-    return ::getsockname(fd, reinterpret_cast<sockaddr *>(&sa), &len) == 0 ? ntohs(sa.sin_port) : 0;
-}
-
-// A loopback socket on a free port: listening, or only bound (connections refused).
-int loopbackSocket(bool listening) {
-    const int fd = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_in sa{};
-    sa.sin_family = AF_INET;
-    sa.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    if (fd < 0 || ::bind(fd, reinterpret_cast<sockaddr *>(&sa), sizeof sa) != 0 ||
-        (listening && ::listen(fd, 8) != 0)) {
-        fail("no loopback socket");
-    }
-    return fd;
+    return o;
 }
 
 int lowestFreeFd() {
@@ -294,17 +230,11 @@ extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     static TempRoot root;
     std::filesystem::create_directories(root / "/root/Halvard/osgi");
     std::ofstream(root / "/root/Halvard/osgi/socketAddress.prop") << "127.0.0.1";
-    listenFd = loopbackSocket(true);
-    deadFd = loopbackSocket(false);
-    serverPort = boundPort(listenFd);
-    deadPort = boundPort(deadFd);
-    // For the listening tests: free now, and only they bind it.
-    const int probe = loopbackSocket(false);
-    listenPort = boundPort(probe);
-    ::close(probe);
+    listenFd = LoopbackSocket(8, &serverPort);
+    if (listenFd < 0 || LoopbackSocket(0, &deadPort) < 0) fail("no loopback socket");
+    listenPort = uipeer::FreePort();  // for the listening tests: free now, and only they bind it
     if (::pipe2(wakePipe, O_CLOEXEC) != 0) fail("no pipe");
-    MAA_SetResultWriter(&capture);
-    std::thread(serverThread).detach();
+    MAA_SetResultWriter(&maarec::Capture);
     return 0;
 }
 
@@ -326,15 +256,12 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     MAA_PanelSetWaits(kLongWaitMs, kLongWaitMs, script.holds ? kShortWaitMs : kLongWaitMs);
 
     const int fdBefore = lowestFreeFd();
-    if (!nobody) {
-        std::lock_guard lk(mu);
-        job = {listening, script};
-        jobPosted = true;
-        jobDone = false;
-        cv.notify_all();
-    }
+    std::promise<Outcome> served;
+    std::future<Outcome> outcome = served.get_future();
+    std::thread server;
+    if (!nobody) server = std::thread([&] { served.set_value(serve(listening, script)); });
     IsDisconnected = pulled ? 1 : 0;
-    written.clear();
+    maarec::written.clear();
     stMAASysResult = {};
     TMAAResult *r = fn.call(arg);
     IsDisconnected = 0;
@@ -342,11 +269,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     if (!nobody) {
         char c = 'r';
         if (::write(wakePipe[1], &c, 1) != 1) fail("wake pipe");
-        std::unique_lock lk(mu);
-        if (!cv.wait_for(lk, std::chrono::milliseconds(3 * kPeerWaitMs), [] { return jobDone; }))
+        if (outcome.wait_for(std::chrono::milliseconds(3 * kPeerWaitMs)) != std::future_status::ready)
             fail("the server thread did not finish (hang)");
-        o = outcome;
-        lk.unlock();
+        o = outcome.get();
+        server.join();
         while (::read(wakePipe[0], &c, 1) != 1) {
         }
     }
@@ -354,15 +280,15 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     // Records: the header, written at once; then the returned record: the
     // header again (no verdict) or the verdict, which ends the test.
     CHECK(r == &stMAASysResult, "the record returned is not the shell's result record");
-    CHECK(written.size() == 1, "not exactly one record written during the call");
-    const Record &header = written[0];
-    CHECK(header.status == MAA_RESULT_CONTINUE && startsWith(header.text, "[ ") && header.text.back() == ']',
+    CHECK(maarec::written.size() == 1, "not exactly one record written during the call");
+    const maarec::Rec &header = maarec::written[0];
+    CHECK(header.st == MAA_RESULT_CONTINUE && startsWith(header.data, "[ ") && header.data.back() == ']',
           "the first record is not the test's header");
-    const Record last = recordOf(r);
-    const bool verdict = last.status == MAA_RESULT_END;
-    CHECK(verdict || (last.status == MAA_RESULT_CONTINUE && last.text == header.text),
+    const maarec::Rec last = maarec::Of(r);
+    const bool verdict = last.st == MAA_RESULT_END;
+    CHECK(verdict || (last.st == MAA_RESULT_CONTINUE && last.data == header.data),
           "no verdict, yet the header was replaced");
-    CHECK(!verdict || (!last.text.empty() && last.text.find('\0') == std::string::npos), "an empty or binary verdict");
+    CHECK(!verdict || (!last.data.empty() && last.data.find('\0') == std::string::npos), "an empty or binary verdict");
 
     // Nothing left open: the test closed its end, and no descriptor remains.
     if (o.connected) CHECK(o.closedByTest, "the connection was left open");
