@@ -21,7 +21,7 @@
 #include "RatioReporter.h"
 #include "UpdateManagerSim.h"
 #include "firmware/FirmWareUpdate.h"
-#include "fuzz/Loopback.h"
+#include "support/Loopback.h"
 #include "support/RandomBytes.h"
 #include "vdev.h"
 

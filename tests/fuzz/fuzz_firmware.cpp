@@ -27,7 +27,7 @@
 
 #include "FuzzCheck.h"
 #include "HostTraffic.h"
-#include "Loopback.h"
+#include "support/Loopback.h"
 #include "firmware/FirmWareUpdate.h"
 #include "firmware/UpdateManager.h"
 #include "vdev.h"

@@ -36,7 +36,7 @@
 #include <vector>
 
 #include "FuzzCheck.h"
-#include "Loopback.h"
+#include "support/Loopback.h"
 #include "adapter/USB.h"
 #include "maa/MAA_IF.h"
 #include "maa/MAA_Result.h"

@@ -4,9 +4,7 @@
 // where "fw.bin" lands.
 #pragma once
 
-#include <arpa/inet.h>
 #include <fcntl.h>
-#include <netinet/in.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -30,6 +28,7 @@
 #include "firmware/FirmWareUpdate.h"
 #include "firmware/UpdateManager.h"
 #include "FwPack.h"
+#include "support/Loopback.h"
 #include "support/RandomBytes.h"
 #include "vdev.h"
 
@@ -56,15 +55,7 @@ public:
     // The answers go out once `answerAfter` bytes have come, as a manager
     // answers what it has read.
     ScriptedPeer(std::string answers, size_t answerAfter) : answers_(std::move(answers)), answerAfter_(answerAfter) {
-        fd_ = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_in a{};
-        a.sin_family = AF_INET;
-        a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        socklen_t len = sizeof a;
-        ::bind(fd_, reinterpret_cast<sockaddr *>(&a), sizeof a);
-        ::listen(fd_, 4);
-        ::getsockname(fd_, reinterpret_cast<sockaddr *>(&a), &len);
-        port_ = ntohs(a.sin_port);
+        fd_ = LoopbackSocket(4, &port_);
         thread_ = std::thread([this] { run(); });
     }
     ~ScriptedPeer() {

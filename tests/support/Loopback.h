@@ -1,4 +1,4 @@
-// TCP on 127.0.0.1 for the peers the targets and benches play (a UI server,
+// TCP on 127.0.0.1 for the peers the tests, targets and benches play (a UI server,
 // an update manager, a plain sink): nothing outside this machine is reached.
 #pragma once
 
