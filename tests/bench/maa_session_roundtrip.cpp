@@ -13,6 +13,7 @@
 
 #include "RatioReporter.h"
 #include "adapter/USB.h"
+#include "common/Wait.h"
 #include "maa/MAA_Address.h"
 #include "maa/MAA_Hook.h"
 #include "maa/MAA_Symbol.h"
@@ -45,6 +46,9 @@ class Device {
 public:
     explicit Device(bool shell, size_t take = 0, size_t answer = 0) : shell_(shell) {
         vdev::Reset();
+        // Bytes a former device's session read ahead are not this one's (the
+        // library's park step forgets them when its channel closes).
+        Wait_PutBack(-1, nullptr, 0, false);
         IsDisconnected = 0;
         fd_ = ::open(vdev::kPrn, O_RDWR);
         ulDrvHandle = static_cast<U32>(fd_);
