@@ -47,7 +47,9 @@ for stage in "${stages[@]}"; do
         # Scratch corpus first, so the checked-in seeds are never rewritten.
         scratch="build/fuzz/corpus/$t"; mkdir -p "$scratch"
         # Six targets in about three minutes; a unit slower than 30 s is a hang.
-        args=(-max_total_time="${FUZZ_SECONDS:-25}" -timeout=30 -rss_limit_mb=2048 -max_len=1100 "$scratch")
+        # A failing or slow input is written under build/fuzz, not into the tree.
+        args=(-max_total_time="${FUZZ_SECONDS:-25}" -timeout=30 -rss_limit_mb=2048 -max_len=1100
+              -artifact_prefix="build/fuzz/$t-" "$scratch")
         [ -f "tests/fuzz/$t.dict" ] && args=(-dict="tests/fuzz/$t.dict" "${args[@]}")
         [ -d "tests/fuzz/corpus/$t" ] && args+=("tests/fuzz/corpus/$t")
         echo "-- $t"
