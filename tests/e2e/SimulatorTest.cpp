@@ -71,7 +71,7 @@ protected:
     // Runs the simulator with `args` (no blanks in them); its exit status, 137
     // when it had to be killed.
     int Run(const std::vector<std::string> &args) {
-        std::string cmd = "timeout -s KILL 45 " USBADAPTER_SIM " --out " + dir_ + "/out --timeout 8000";
+        std::string cmd = "timeout -s KILL " E2E_SIM_KILL_S " " USBADAPTER_SIM " --out " + dir_ + "/out --timeout 8000";
         for (const std::string &a : args) cmd += " '" + a + "'";
         const int status = std::system((cmd + " >" + Path("sim-output.txt") + " 2>&1").c_str());
         output_ = ReadFile(Path("sim-output.txt"));
