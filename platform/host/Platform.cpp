@@ -4,15 +4,18 @@
 #include <iterator>
 #include <map>
 #include <mutex>
+#include <vector>
+
+#include <sanitizer/asan_interface.h>
 
 #include "platform/Platform.h"
 
 namespace {
 
-// Data blocks are plain heap buffers. Each live block also gets a 32-bit
-// "kernel address" of its own, so that a driver model given that address (as a
-// real driver is) can find the memory again; a released block's address no
-// longer translates.
+// Data blocks are heap buffers, not cleared on reuse. Each live block also
+// gets a 32-bit "kernel address" of its own, so that a driver model given that
+// address (as a real driver is) can find the memory again; a released block's
+// address no longer translates.
 struct HostDataBlock {
     void *memory;
     uint32_t size;
@@ -39,6 +42,40 @@ uint32_t PlaceKerAddr(uint32_t size) {
     return at + need <= kKerEnd ? static_cast<uint32_t>(at) : 0;
 }
 
+// Like the controller's pool, released memory is kept for the next block of
+// the same size instead of going back to the system: a scanner command takes
+// a 4 MiB block each time, and fresh pages for it cost more than the command.
+// Parked memory is poisoned, so a use after release is still caught.
+struct Spare {
+    void *memory;
+    uint32_t size;
+};
+constexpr size_t kMaxSpares = 2;
+std::vector<Spare> gSpares;  // guarded by gMu
+
+// Both expect gMu held.
+void *TakeMemoryLocked(uint32_t size) {
+    for (auto it = gSpares.begin(); it != gSpares.end(); ++it) {
+        if (it->size != size) continue;
+        void *memory = it->memory;
+        gSpares.erase(it);
+        ASAN_UNPOISON_MEMORY_REGION(memory, size ? size : 1);
+        return memory;
+    }
+    return std::calloc(1, size ? size : 1);
+}
+
+void ParkMemoryLocked(void *memory, uint32_t size) {
+    if (gSpares.size() == kMaxSpares) {
+        const Spare oldest = gSpares.front();
+        gSpares.erase(gSpares.begin());
+        ASAN_UNPOISON_MEMORY_REGION(oldest.memory, oldest.size ? oldest.size : 1);
+        std::free(oldest.memory);
+    }
+    ASAN_POISON_MEMORY_REGION(memory, size ? size : 1);
+    gSpares.push_back({memory, size});
+}
+
 }  // namespace
 
 extern "C" {
@@ -54,12 +91,12 @@ int DBPool_GetSystemPoolID(void) { return 1; }
 DataBlockTicket DataBlock_CreateFromPool(int, unsigned int size) {
     auto *b = static_cast<HostDataBlock *>(std::calloc(1, sizeof(HostDataBlock)));
     if (!b) return nullptr;
-    b->memory = std::calloc(1, size ? size : 1);
-    b->size = size;
     std::lock_guard lk(gMu);
+    b->memory = TakeMemoryLocked(size);
+    b->size = size;
     b->kerAddr = b->memory ? PlaceKerAddr(size) : 0;
     if (b->kerAddr == 0) {
-        std::free(b->memory);
+        if (b->memory) ParkMemoryLocked(b->memory, size);
         std::free(b);
         return nullptr;
     }
@@ -79,8 +116,8 @@ int DataBlock_ReleaseTicket(DataBlockTicket t) {
     {
         std::lock_guard lk(gMu);
         gByKerAddr.erase(b->kerAddr);
+        ParkMemoryLocked(b->memory, b->size);
     }
-    std::free(b->memory);
     std::free(b);
     return 0;
 }
