@@ -14,12 +14,13 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include <atomic>
 #include <chrono>
+#include <condition_variable>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
+#include <mutex>
 #include <string>
 #include <string_view>
 #include <thread>
@@ -36,6 +37,56 @@ namespace {
 
 int g_listen = -1;
 int g_wake[2] = {-1, -1};  // readable once the download has returned
+// Never destroyed: the manager still waits on them when the process exits.
+std::mutex &g_mu = *new std::mutex;
+std::condition_variable &g_cv = *new std::condition_variable;
+const std::vector<std::string> *g_answers = nullptr;  // set while a download runs
+
+// The manager, one thread for the whole run (a thread per input costs more
+// than the input). While a download runs it accepts each connection, sends it
+// its answer, and reads whatever the library sends; the wake pipe ends the
+// round, and every connection of the round, the unaccepted ones too, is closed.
+void Manager() {
+    char buf[4096];
+    for (;;) {
+        const std::vector<std::string> *answers;
+        {
+            std::unique_lock lk(g_mu);
+            g_cv.wait(lk, [] { return g_answers != nullptr; });
+            answers = g_answers;
+        }
+        std::vector<int> conns;  // in order of connection; -1 once the library has closed it
+        for (bool woken = false; !woken;) {
+            std::vector<pollfd> p = {{g_listen, POLLIN, 0}, {g_wake[0], POLLIN, 0}};
+            for (int c : conns) p.push_back({c, POLLIN, 0});
+            if (::poll(p.data(), p.size(), 1000) <= 0) continue;
+            woken = p[1].revents != 0;
+            for (int c; (c = ::accept4(g_listen, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK)) >= 0;) {
+                if (!woken && conns.size() < answers->size())
+                    ::send(c, (*answers)[conns.size()].data(), (*answers)[conns.size()].size(), MSG_NOSIGNAL);
+                conns.push_back(c);
+            }
+            for (int &c : conns) {
+                ssize_t n;
+                while ((n = ::recv(c, buf, sizeof buf, 0)) > 0) {
+                }
+                if (n == 0) {
+                    ::close(c);
+                    c = -1;
+                }
+            }
+        }
+        char c;
+        if (::read(g_wake[0], &c, 1) != 1) fail("wake pipe");
+        for (int fd : conns)
+            if (fd >= 0) ::close(fd);
+        {
+            std::lock_guard lk(g_mu);
+            g_answers = nullptr;
+        }
+        g_cv.notify_one();
+    }
+}
 
 void Setup() {
     // fw.bin lands in the working directory; libFuzzer's paths are relative
@@ -43,11 +94,13 @@ void Setup() {
     ::setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
     uint16_t port = 0;
     if ((g_listen = LoopbackSocket(64, &port)) < 0) fail("cannot listen");
+    if (::fcntl(g_listen, F_SETFL, O_NONBLOCK) != 0) fail("cannot listen");
     ::setenv(UPDATE_PORT_ENV, std::to_string(port).c_str(), 1);
     UpdateManager_SetWaitMs(2);
     if (::pipe2(g_wake, O_CLOEXEC) != 0) fail("no pipe");
     // The marks on standard output are not the fuzzer's business.
     if (!std::freopen("/dev/null", "w", stdout)) fail("no /dev/null");
+    std::thread(Manager).detach();
 }
 
 int CountFds() {
@@ -76,29 +129,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     for (const std::string &t : transfers)
         if (!t.empty()) vdev::HostWrite(vdev::kPrn, t);
 
-    std::atomic<bool> done{false};
-    std::thread manager([&] {
-        std::vector<int> conns;
-        size_t next = 0;
-        char buf[4096];
-        while (!done) {
-            // The wake pipe ends the wait as soon as the download has returned.
-            pollfd p[2] = {{g_listen, POLLIN, 0}, {g_wake[0], POLLIN, 0}};
-            if (::poll(p, 2, 1) > 0 && p[0].revents != 0) {
-                int c = ::accept4(g_listen, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
-                if (c >= 0) {
-                    if (next < answers.size())
-                        ::send(c, answers[next].data(), answers[next].size(), MSG_NOSIGNAL);
-                    ++next;
-                    conns.push_back(c);
-                }
-            }
-            for (int c : conns)
-                while (::recv(c, buf, sizeof buf, 0) > 0) {
-                }
-        }
-        for (int c : conns) ::close(c);
-    });
+    {
+        std::lock_guard lk(g_mu);
+        g_answers = &answers;
+    }
+    g_cv.notify_one();
 
     U8 cmd[2] = {static_cast<U8>(first2[0]), static_cast<U8>(first2[1])};
     U8 out[FW_PJL_HEADER_SIZE];
@@ -106,11 +141,12 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     const auto t0 = std::chrono::steady_clock::now();
     const S32 r = FirmWareDownload(fd, cmd, 2, out, &firmware);
     if (std::chrono::steady_clock::now() - t0 > std::chrono::seconds(10)) fail("download took more than 10 s");
-    done = true;
     char c = 'w';
     if (::write(g_wake[1], &c, 1) != 1) fail("wake pipe");
-    manager.join();
-    if (::read(g_wake[0], &c, 1) != 1) fail("wake pipe");
+    {
+        std::unique_lock lk(g_mu);
+        g_cv.wait(lk, [] { return g_answers == nullptr; });
+    }
     ::close(fd);
     vdev::Reset();  // the host ends of the node
     if (r < -1 || r > FW_PJL_HEADER_SIZE) fail("result outside -1..80");
