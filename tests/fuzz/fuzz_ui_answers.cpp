@@ -24,15 +24,19 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
+#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <future>
+#include <mutex>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include "FuzzCheck.h"
@@ -214,6 +218,35 @@ Outcome serve(bool peer, const Script &script) {
     return o;
 }
 
+// The server runs on one thread for the whole run: a thread per input costs
+// more than the input under ASan. Never destroyed: the thread still waits on
+// them when the process exits.
+std::mutex &jobMu = *new std::mutex;
+std::condition_variable &jobCv = *new std::condition_variable;
+std::function<void()> job;
+
+void serverThread() {
+    for (;;) {
+        std::function<void()> next;
+        {
+            std::unique_lock lk(jobMu);
+            jobCv.wait(lk, [] { return static_cast<bool>(job); });
+            next = std::exchange(job, nullptr);
+        }
+        next();
+    }
+}
+
+void runOnServerThread(std::function<void()> f) {
+    static bool started = (std::thread(serverThread).detach(), true);
+    (void)started;
+    {
+        std::lock_guard lk(jobMu);
+        job = std::move(f);
+    }
+    jobCv.notify_one();
+}
+
 int lowestFreeFd() {
     const int fd = ::dup(0);
     ::close(fd);
@@ -258,8 +291,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     const int fdBefore = lowestFreeFd();
     std::promise<Outcome> served;
     std::future<Outcome> outcome = served.get_future();
-    std::thread server;
-    if (!nobody) server = std::thread([&] { served.set_value(serve(listening, script)); });
+    if (!nobody) runOnServerThread([&] { served.set_value(serve(listening, script)); });
     IsDisconnected = pulled ? 1 : 0;
     maarec::written.clear();
     stMAASysResult = {};
@@ -272,7 +304,6 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
         if (outcome.wait_for(std::chrono::milliseconds(3 * kPeerWaitMs)) != std::future_status::ready)
             fail("the server thread did not finish (hang)");
         o = outcome.get();
-        server.join();
         while (::read(wakePipe[0], &c, 1) != 1) {
         }
     }
