@@ -112,6 +112,14 @@ TEST_F(ScanDriver, OnlyTheReportedCountIsSentAndNeverMoreThanTheBuffer) {
     EXPECT_TRUE(LoggerHost_Contains("[MAA] result is larger than allocation (5242880)\n"));
     EXPECT_TRUE(written.empty());
     EXPECT_FALSE(vdev::ScanLocked());
+
+    // The next command's buffer is cleared: past what its driver wrote, the
+    // host gets zeros, not the last response.
+    Restart();
+    const std::string shortOne = Frame(MAA_RESULT_END, 1, "ok");
+    Answer(shortOne, static_cast<U32>(shortOne.size() + MAA_RESULT_HEADER_SIZE));
+    GetShadingData(1);
+    EXPECT_EQ(Wire(), shortOne + std::string(MAA_RESULT_HEADER_SIZE, '\0'));
 }
 
 TEST_F(ScanDriver, SFRReadWriteRefusesAnUnmappedAddressAndCutsALongText) {
