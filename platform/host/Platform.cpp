@@ -55,10 +55,11 @@ std::vector<Spare> gSpares;  // guarded by gMu
 
 // Both expect gMu held.
 void *TakeMemoryLocked(uint32_t size) {
-    for (auto it = gSpares.begin(); it != gSpares.end(); ++it) {
+    // The most recently released first: its pages are the warmest.
+    for (auto it = gSpares.rbegin(); it != gSpares.rend(); ++it) {
         if (it->size != size) continue;
         void *memory = it->memory;
-        gSpares.erase(it);
+        gSpares.erase(std::next(it).base());
         ASAN_UNPOISON_MEMORY_REGION(memory, size ? size : 1);
         return memory;
     }
