@@ -28,6 +28,7 @@
 #include <string_view>
 #include <vector>
 
+#include "ControllerMalloc.h"
 #include "FuzzCheck.h"
 #include "HostTraffic.h"
 #include "adapter/USB.h"

@@ -23,7 +23,6 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <cerrno>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
@@ -36,6 +35,7 @@
 #include <thread>
 #include <vector>
 
+#include "ControllerMalloc.h"
 #include "FuzzCheck.h"
 #include "HostTraffic.h"
 #include "adapter/Classifier.h"
@@ -56,7 +56,6 @@ constexpr auto kHangAfterPull = std::chrono::seconds(1);
 // Polls and reads in a row with nothing pending before the device counts as
 // waiting for the host. Only the retry loops get there.
 constexpr size_t kIdleCalls = 64;
-constexpr size_t kControllerAllocLimit = size_t{16} << 20;
 
 // ---- Java's side ----------------------------------------------------------
 
@@ -296,22 +295,6 @@ bool asksForAnswer(std::string_view host) {
 }
 
 }  // namespace
-
-// The controller is a 32-bit machine: an allocation of the size a host may
-// announce (up to 2 GiB for an application body) fails there. This target is
-// linked with malloc wrapped (tests/fuzz/CMakeLists.txt), so that a large
-// allocation fails here too, quietly: the product's allocation-failure paths
-// run. The bound is lower than the controller's so that each input stays
-// fast: ASan clears shadow memory for every large block, and inputs that
-// announce hundreds of MiB cut the run rate to a third.
-extern "C" void *__real_malloc(size_t size);
-extern "C" void *__wrap_malloc(size_t size) {
-    if (size > kControllerAllocLimit) {
-        errno = ENOMEM;
-        return nullptr;
-    }
-    return __real_malloc(size);
-}
 
 extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
