@@ -51,7 +51,9 @@ struct Spare {
     uint32_t size;
 };
 constexpr size_t kMaxSpares = 2;
-std::vector<Spare> gSpares;  // guarded by gMu
+// Guarded by gMu. Never destroyed, so that the spares stay reachable (no
+// leak report) and a block released while the process exits has a place.
+std::vector<Spare> &gSpares = *new std::vector<Spare>;
 
 // Both expect gMu held.
 void *TakeMemoryLocked(uint32_t size) {
