@@ -13,7 +13,7 @@
 #include <cerrno>
 #include <cstddef>
 
-constexpr size_t kControllerAllocLimit = size_t{16} << 20;
+constexpr size_t kControllerAllocLimit = size_t{4} << 20;
 
 extern "C" void *__real_malloc(size_t size);
 extern "C" void *__wrap_malloc(size_t size) {
