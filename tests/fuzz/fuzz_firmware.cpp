@@ -9,6 +9,7 @@
 //   is sent when the library connects and waits until it reads it.
 // Checked: the call returns within a bound, with -1, 0 or a count of at most
 // 80 bytes; it never leaves a connection or descriptor open.
+#include <dirent.h>
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -19,7 +20,6 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
-#include <filesystem>
 #include <mutex>
 #include <string>
 #include <string_view>
@@ -103,9 +103,17 @@ void Setup() {
     std::thread(Manager).detach();
 }
 
+// Counted without allocating: a directory_iterator's buffers cost ASan a
+// tenth of the run.
 int CountFds() {
+    const int dir = ::open("/proc/self/fd", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    if (dir < 0) fail("no /proc/self/fd");
+    alignas(dirent64) char buf[8192];
     int n = 0;
-    for ([[maybe_unused]] auto &e : std::filesystem::directory_iterator("/proc/self/fd")) ++n;
+    for (ssize_t got; (got = ::getdents64(dir, buf, sizeof buf)) > 0;)
+        for (ssize_t at = 0; at < got; at += reinterpret_cast<dirent64 *>(buf + at)->d_reclen)
+            n += reinterpret_cast<dirent64 *>(buf + at)->d_name[0] != '.';
+    ::close(dir);
     return n;
 }
 
