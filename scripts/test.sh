@@ -30,7 +30,16 @@ run_preset() {
   cmake --preset "$preset" >/dev/null
   cmake --build --preset "$preset"
   echo "== $preset: tests"
-  ctest --preset "$preset" --timeout 300
+  if [ "$preset" = tsan ]; then
+    # OpenJDK does not support ThreadSanitizer. One JVM test that starts no
+    # thread of the library hung there once, after it had started, and not
+    # again in some 300 reruns; so a JVM test that times out under TSan gets
+    # a second run. A real deadlock hangs that one too.
+    ctest --preset tsan --timeout 300 -LE '^jvm$'
+    ctest --preset tsan --timeout 300 -L '^jvm$' --repeat after-timeout:2
+  else
+    ctest --preset "$preset" --timeout 300
+  fi
 }
 
 for stage in "${stages[@]}"; do
