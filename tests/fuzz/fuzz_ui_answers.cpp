@@ -228,6 +228,7 @@ Outcome serve(bool peer, const Script &script) {
 std::mutex &jobMu = *new std::mutex;
 std::condition_variable &jobCv = *new std::condition_variable;
 std::function<void()> job;
+bool busy = false;  // from a job's hand-over until it has returned
 
 void serverThread() {
     for (;;) {
@@ -238,6 +239,12 @@ void serverThread() {
             next = std::exchange(job, nullptr);
         }
         next();
+        next = nullptr;
+        {
+            std::lock_guard lk(jobMu);
+            busy = false;
+        }
+        jobCv.notify_all();
     }
 }
 
@@ -247,8 +254,16 @@ void runOnServerThread(std::function<void()> f) {
     {
         std::lock_guard lk(jobMu);
         job = std::move(f);
+        busy = true;
     }
-    jobCv.notify_one();
+    jobCv.notify_all();
+}
+
+// As a join would: the job may still be inside set_value after its outcome
+// is ready, and the promise lives on the caller's stack.
+void waitServerIdle() {
+    std::unique_lock lk(jobMu);
+    jobCv.wait(lk, [] { return !busy; });
 }
 
 int lowestFreeFd() {
@@ -308,6 +323,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
         if (outcome.wait_for(std::chrono::milliseconds(3 * kPeerWaitMs)) != std::future_status::ready)
             fail("the server thread did not finish (hang)");
         o = outcome.get();
+        waitServerIdle();
         while (::read(wakePipe[0], &c, 1) != 1) {
         }
     }
