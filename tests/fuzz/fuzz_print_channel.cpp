@@ -174,47 +174,49 @@ void sendNextPhase() {
 
 // The host's patience: it sends the next phase when the device waits for
 // more, pulls the cable when it has nothing left to send, and reports a turn
-// that never returns.
-void watcher() {
-    uint64_t seen = 0;
-    size_t base = 0, pending = 0;
-    Clock::time_point pulledAt;
-    bool inTurn = false;
-    for (;;) {
-        // Closer looks while a turn runs: each wait for the host costs the
-        // input that much time.
-        std::this_thread::sleep_for(std::chrono::microseconds(inTurn ? 50 : 200));
-        std::lock_guard lk(hostMu);
-        inTurn = turn & 1;
-        if (!inTurn) continue;
-        size_t calls = vdev::PollCalls(vdev::kPrn) + vdev::ReadCalls(vdev::kPrn);
-        size_t p = vdev::PendingHostBytes(vdev::kPrn);
-        Clock::time_point now = Clock::now();
-        if (turn != seen) {
-            seen = turn;
-            base = calls;
-            pending = p;
-            continue;
-        }
-        if (now - turnStart > kTurnLimit) fail("a reader turn did not return (hang)");
-        if (p != 0 || p != pending) {
-            pending = p;
-            base = calls;
-            continue;
-        }
-        if (calls - base < kIdleCalls) continue;
+// that never returns. The reader looks itself before each poll or read of the
+// node (no scheduler between it and the host); the watcher catches the turns
+// that stop polling and reading. With hostMu held, inside a turn.
+uint64_t seen = 0;
+size_t base = 0, pending = 0;
+Clock::time_point pulledAt;
+
+void hostLooks() {
+    size_t calls = vdev::PollCalls(vdev::kPrn) + vdev::ReadCalls(vdev::kPrn);
+    size_t p = vdev::PendingHostBytes(vdev::kPrn);
+    Clock::time_point now = Clock::now();
+    if (turn != seen) {
+        seen = turn;
         base = calls;
-        if (nextPhase < phases.size()) {
-            sendNextPhase();
-            pending = vdev::PendingHostBytes(vdev::kPrn);
-        } else if (!pulled) {
-            if (strict) fail("the device waits for the host without bound (strict mode)");
-            pulled = true;
-            pulledAt = now;
-            IsDisconnected = 1;
-        } else if (now - pulledAt > kHangAfterPull) {
-            fail("the device still waits for the host after the cable was pulled (hang)");
-        }
+        pending = p;
+        return;
+    }
+    if (now - turnStart > kTurnLimit) fail("a reader turn did not return (hang)");
+    if (p != 0 || p != pending) {
+        pending = p;
+        base = calls;
+        return;
+    }
+    if (calls - base < kIdleCalls) return;
+    base = calls;
+    if (nextPhase < phases.size()) {
+        sendNextPhase();
+        pending = vdev::PendingHostBytes(vdev::kPrn);
+    } else if (!pulled) {
+        if (strict) fail("the device waits for the host without bound (strict mode)");
+        pulled = true;
+        pulledAt = now;
+        IsDisconnected = 1;
+    } else if (now - pulledAt > kHangAfterPull) {
+        fail("the device still waits for the host after the cable was pulled (hang)");
+    }
+}
+
+void watcher() {
+    for (;;) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        std::lock_guard lk(hostMu);
+        if (turn & 1) hostLooks();
     }
 }
 
@@ -294,7 +296,26 @@ bool asksForAnswer(std::string_view host) {
     return false;
 }
 
+// The reader's waits on the node, seen by the host first (bytes put back in
+// front of the node answer at once: no wait).
+void readerWaits(int fd) {
+    if (fd != fdPrn || Wait_PutBackLeft(fd) > 0) return;
+    std::lock_guard lk(hostMu);
+    if (turn & 1) hostLooks();
+}
+
 }  // namespace
+
+extern "C" int __real__Z11Wait_PollIniiPsPFbvEi(int fd, int timeoutMs, short *revents, WaitGoneFn gone, int wakeFd);
+extern "C" int __wrap__Z11Wait_PollIniiPsPFbvEi(int fd, int timeoutMs, short *revents, WaitGoneFn gone, int wakeFd) {
+    readerWaits(fd);
+    return __real__Z11Wait_PollIniiPsPFbvEi(fd, timeoutMs, revents, gone, wakeFd);
+}
+extern "C" ssize_t __real__Z9Wait_ReadiPvmPFbvE(int fd, void *buf, size_t size, WaitGoneFn gone);
+extern "C" ssize_t __wrap__Z9Wait_ReadiPvmPFbvE(int fd, void *buf, size_t size, WaitGoneFn gone) {
+    readerWaits(fd);
+    return __real__Z9Wait_ReadiPvmPFbvE(fd, buf, size, gone);
+}
 
 extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
