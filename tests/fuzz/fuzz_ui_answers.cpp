@@ -1,16 +1,16 @@
 // The operator-panel tests against a UI server whose every move the input
 // chooses: the answers it sends (garbage, short, long, in pieces), whether it
 // closes or holds the connection, refuses it, or (for the two listening tests)
-// finds the port taken. The server is a thread of this process on loopback; the
-// panel's port comes from USBADAPTER_UI_PORT.
+// finds the port taken. The server is played on loopback in the test's own
+// thread; the panel's port comes from USBADAPTER_UI_PORT.
 //
 // Input: byte 0 the test function, byte 1 flags (bit 0: nobody at the port,
 // bit 1: the cable is pulled during the call), bytes 2-5 the host's argument
 // (little-endian), then the server's script, one step per byte (mod 5):
 //   0 n b...  send the n bytes behind (one write)
 //   1 b k     send (k + 1) * 64 bytes of b (one write)
-//   2         pause 0.2 ms (the next send is likely a read of its own); only
-//             the first kMaxPauses count, or sleeping would be most of a run
+//   2         pause: what follows is sent at the test's next wait (a read of
+//             its own) once something has been sent
 //   3         close (the server's writing end; it then waits for the test to close)
 //   4         hold: send nothing more and wait for the test to close
 // A script that runs out closes. Every input checks: the records the host gets
@@ -24,20 +24,13 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <functional>
-#include <future>
-#include <mutex>
 #include <string>
-#include <thread>
-#include <utility>
 #include <vector>
 
 #include "FuzzCheck.h"
@@ -51,10 +44,6 @@
 #include "support/TempRoot.h"
 
 namespace {
-
-constexpr int kLongWaitMs = 3000;  // the panel's waits when an answer is due
-constexpr int kShortWaitMs = 1;    // when the server holds: the wait itself is the outcome
-constexpr int kPeerWaitMs = 3000;  // any one step of the server thread
 
 // ---- the panel tests -----------------------------------------------------------
 
@@ -104,11 +93,8 @@ struct Script {
     bool answers = false;  // sends at least one byte
 };
 
-constexpr int kMaxPauses = 4;
-
 Script parseScript(const uint8_t *d, size_t n) {
     Script s;
-    int pauses = 0;
     for (size_t i = 0; i < n && !s.holds;) {
         const int op = d[i++] % 5;
         if (op == 0) {
@@ -121,7 +107,7 @@ Script parseScript(const uint8_t *d, size_t n) {
             const size_t k = i < n ? d[i++] : 0;
             s.steps.push_back({Step::Send, std::string((k + 1) * 64, b)});
         } else if (op == 2) {
-            if (++pauses <= kMaxPauses) s.steps.push_back({Step::Pause, {}});
+            s.steps.push_back({Step::Pause, {}});
         } else if (op == 3) {
             s.steps.push_back({Step::Close, {}});
             break;
@@ -134,16 +120,17 @@ Script parseScript(const uint8_t *d, size_t n) {
     return s;
 }
 
-// ---- the server thread --------------------------------------------------------------
+// ---- the server ------------------------------------------------------------------
 
-int64_t nowMs() {
-    return std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now().time_since_epoch())
-        .count();
-}
+// The UI server is played in the test's own thread: whenever the test is about
+// to wait (every wait of the panel is a poll), the server first takes its next
+// steps. Loopback delivers at once, so the wait then finds what the server
+// sent, or finds that nothing will come: a wait that would only run out ends
+// at once and moves the panel's clock on by its length instead. No thread has
+// to be scheduled, no time passes, and each input runs the same way each time.
 
 uint16_t serverPort, listenPort, deadPort;
 int listenFd = -1;
-int wakePipe[2] = {-1, -1};  // readable once the call under test has returned
 
 struct Outcome {
     bool connected = false;
@@ -152,119 +139,97 @@ struct Outcome {
     std::string after;          // what arrived after it
 };
 
-// 1: readable within the bound; 0: not, or the call has returned and nothing is there.
-int waitIn(int fd, int timeoutMs) {
-    const int64_t deadline = nowMs() + timeoutMs;
-    for (;;) {
-        const int64_t left = deadline - nowMs();
-        pollfd p[2] = {{fd, POLLIN, 0}, {wakePipe[0], POLLIN, 0}};
-        const int rc = ::poll(p, 2, static_cast<int>(std::max<int64_t>(left, 0)));
-        if (rc < 0 && errno == EINTR) continue;
-        if (rc <= 0) return 0;
-        if (p[0].revents != 0) return 1;
-        // The call is over: whatever it left is already here.
-        pollfd q{fd, POLLIN, 0};
-        return ::poll(&q, 1, 0) > 0 ? 1 : 0;
-    }
-}
+class Server {
+public:
+    Server(bool peer, const Script &script) : peer_(peer), steps_(script.steps) {}
 
-// Connects to a listening test, retrying until it listens or has returned.
-int connectPeer() {
-    for (const int64_t deadline = nowMs() + kPeerWaitMs; nowMs() < deadline;) {
-        if (const int fd = LoopbackConnect(listenPort); fd >= 0) return fd;
-        pollfd p{wakePipe[0], POLLIN, 0};
-        if (::poll(&p, 1, 0) > 0) return -1;
-        std::this_thread::sleep_for(std::chrono::microseconds(100));
+    // The server's moves before one wait of the test.
+    void advance() {
+        if (fd_ < 0 && !connect()) return;
+        take();
+        if (o_.request.empty()) return;  // the script answers a request
+        flush();
+        bool burst = false;  // a pause splits sends, so it ends a burst only once something went
+        while (out_.empty() && step_ < steps_.size()) {
+            const Step &st = steps_[step_];
+            if (st.op == Step::Send) {
+                out_ = st.bytes;
+                sent_ = burst = true;
+                flush();
+            } else if (st.op == Step::Pause) {
+                if (burst) break;
+            } else {
+                break;  // close, or hold for good
+            }
+            ++step_;
+        }
+        const bool closes = step_ == steps_.size() || steps_[step_].op == Step::Close;
+        if (out_.empty() && closes && !shut_) {
+            ::shutdown(fd_, SHUT_WR);
+            shut_ = true;
+        }
+        take();
     }
-    return -1;
-}
 
-// One call's server: accepts the test's connection, or with `peer` connects to
-// a listening test; follows the script and watches the test close its end.
-Outcome serve(bool peer, const Script &script) {
-    Outcome o;
-    int fd = -1;
-    if (peer) {
-        fd = connectPeer();
-    } else if (waitIn(listenFd, kPeerWaitMs) == 1) {
-        fd = ::accept4(listenFd, nullptr, nullptr, SOCK_CLOEXEC);
+    // After the call: what the test left behind. Its end must be closed by now.
+    Outcome finish() {
+        if (fd_ < 0) connect();  // a client test may have connected and never waited
+        if (fd_ >= 0) {
+            take();
+            ::close(fd_);
+        }
+        for (int extra; (extra = ::accept4(listenFd, nullptr, nullptr, SOCK_CLOEXEC)) >= 0;) ::close(extra);
+        return o_;
     }
-    if (fd < 0) return o;
-    o.connected = true;
-    // The request: a client test's one or two bytes, a listening test's command.
-    if (waitIn(fd, kPeerWaitMs) == 1) uipeer::ReadSome(fd, o.request);
-    bool sent = false;
-    for (const Step &st : script.steps) {
-        if (st.op == Step::Send) {
-            uipeer::SendAll(fd, st.bytes);
-            sent = true;
-        } else if (st.op == Step::Pause) {
-            std::this_thread::sleep_for(std::chrono::microseconds(200));
-        } else {
-            break;
+
+private:
+    bool connect() {
+        // A listening test is connected to (refused at once until it listens);
+        // a client test's connection is taken from the listener.
+        fd_ = peer_ ? LoopbackConnect(listenPort) : ::accept4(listenFd, nullptr, nullptr, SOCK_CLOEXEC);
+        if (fd_ < 0) return false;
+        ::fcntl(fd_, F_SETFL, O_NONBLOCK);
+        o_.connected = true;
+        return true;
+    }
+    void take() {
+        char buf[4096];
+        for (;;) {
+            const ssize_t n = ::recv(fd_, buf, sizeof buf, 0);
+            if (n > 0) {
+                (sent_ ? o_.after : o_.request).append(buf, static_cast<size_t>(n));
+            } else if (n < 0 && errno == EINTR) {
+                continue;
+            } else {
+                if (n == 0 || errno != EAGAIN) o_.closedByTest = true;
+                return;
+            }
         }
     }
-    if (!script.holds) ::shutdown(fd, SHUT_WR);
-    // Until the test closes its end: it must, once the call has returned.
-    const int64_t deadline = nowMs() + kPeerWaitMs;
-    for (;;) {
-        pollfd p{fd, POLLIN, 0};
-        const int64_t left = deadline - nowMs();
-        if (left <= 0 || ::poll(&p, 1, static_cast<int>(left)) <= 0) break;
-        std::string got;
-        if (!uipeer::ReadSome(fd, got)) {
-            o.closedByTest = true;
-            break;
+    void flush() {
+        while (!out_.empty()) {
+            const ssize_t n = ::send(fd_, out_.data(), out_.size(), MSG_NOSIGNAL);
+            if (n < 0 && errno == EINTR) continue;
+            if (n <= 0) {
+                if (errno != EAGAIN) out_.clear();  // the test is gone
+                return;
+            }
+            out_.erase(0, static_cast<size_t>(n));
         }
-        (sent ? o.after : o.request) += got;
     }
-    ::close(fd);
-    return o;
-}
 
-// The server runs on one thread for the whole run: a thread per input costs
-// more than the input under ASan. Never destroyed: the thread still waits on
-// them when the process exits.
-std::mutex &jobMu = *new std::mutex;
-std::condition_variable &jobCv = *new std::condition_variable;
-std::function<void()> job;
-bool busy = false;  // from a job's hand-over until it has returned
+    const bool peer_;
+    const std::vector<Step> &steps_;
+    size_t step_ = 0;
+    int fd_ = -1;
+    std::string out_;  // sent by the script, not yet taken by the socket
+    bool sent_ = false, shut_ = false;
+    Outcome o_;
+};
 
-void serverThread() {
-    for (;;) {
-        std::function<void()> next;
-        {
-            std::unique_lock lk(jobMu);
-            jobCv.wait(lk, [] { return static_cast<bool>(job); });
-            next = std::exchange(job, nullptr);
-        }
-        next();
-        next = nullptr;
-        {
-            std::lock_guard lk(jobMu);
-            busy = false;
-        }
-        jobCv.notify_all();
-    }
-}
-
-void runOnServerThread(std::function<void()> f) {
-    static bool started = (std::thread(serverThread).detach(), true);
-    (void)started;
-    {
-        std::lock_guard lk(jobMu);
-        job = std::move(f);
-        busy = true;
-    }
-    jobCv.notify_all();
-}
-
-// As a join would: the job may still be inside set_value after its outcome
-// is ready, and the promise lives on the caller's stack.
-void waitServerIdle() {
-    std::unique_lock lk(jobMu);
-    jobCv.wait(lk, [] { return !busy; });
-}
+Server *server = nullptr;  // while a call under test runs
+bool inCall = false;
+int64_t clockSkewMs = 0;   // the waits that ran out, added to the panel's clock
 
 int lowestFreeFd() {
     const int fd = ::dup(0);
@@ -276,6 +241,17 @@ bool startsWith(const std::string &s, const char *prefix) { return s.rfind(prefi
 
 }  // namespace
 
+extern "C" int __real_poll(pollfd *fds, nfds_t n, int timeoutMs);
+extern "C" int __wrap_poll(pollfd *fds, nfds_t n, int timeoutMs) {
+    if (!inCall) return __real_poll(fds, n, timeoutMs);
+    if (server) server->advance();
+    const int rc = __real_poll(fds, n, 0);
+    if (rc == 0 && timeoutMs > 0) clockSkewMs += timeoutMs;
+    return rc;
+}
+extern "C" int64_t __real__Z10Wait_NowMsv();
+extern "C" int64_t __wrap__Z10Wait_NowMsv() { return __real__Z10Wait_NowMsv() + clockSkewMs; }
+
 extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
     // The UI server's address file names loopback, so nothing else is ever reached.
@@ -284,8 +260,8 @@ extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     std::ofstream(root / "/root/Halvard/osgi/socketAddress.prop") << "127.0.0.1";
     listenFd = LoopbackSocket(8, &serverPort);
     if (listenFd < 0 || LoopbackSocket(0, &deadPort) < 0) fail("no loopback socket");
+    ::fcntl(listenFd, F_SETFL, O_NONBLOCK);  // the server takes only what has come
     listenPort = uipeer::FreePort();  // for the listening tests: free now, and only they bind it
-    if (::pipe2(wakePipe, O_CLOEXEC) != 0) fail("no pipe");
     MAA_SetResultWriter(&maarec::Capture);
     return 0;
 }
@@ -304,29 +280,19 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     // find it taken (by the server's own listener).
     const uint16_t port = listening ? (nobody ? serverPort : listenPort) : (nobody ? deadPort : serverPort);
     setenv("USBADAPTER_UI_PORT", std::to_string(port).c_str(), 1);
-    // Only a wait that is itself the outcome is short; one that an answer ends is long.
-    MAA_PanelSetWaits(kLongWaitMs, kLongWaitMs, script.holds ? kShortWaitMs : kLongWaitMs);
 
     const int fdBefore = lowestFreeFd();
-    std::promise<Outcome> served;
-    std::future<Outcome> outcome = served.get_future();
-    if (!nobody) runOnServerThread([&] { served.set_value(serve(listening, script)); });
+    Server peerServer(listening, script);
+    server = nobody ? nullptr : &peerServer;
     IsDisconnected = pulled ? 1 : 0;
     maarec::written.clear();
     stMAASysResult = {};
+    inCall = true;
     TMAAResult *r = fn.call(arg);
+    inCall = false;
+    server = nullptr;
     IsDisconnected = 0;
-    Outcome o;
-    if (!nobody) {
-        char c = 'r';
-        if (::write(wakePipe[1], &c, 1) != 1) fail("wake pipe");
-        if (outcome.wait_for(std::chrono::milliseconds(3 * kPeerWaitMs)) != std::future_status::ready)
-            fail("the server thread did not finish (hang)");
-        o = outcome.get();
-        waitServerIdle();
-        while (::read(wakePipe[0], &c, 1) != 1) {
-        }
-    }
+    const Outcome o = nobody ? Outcome{} : peerServer.finish();
 
     // Records: the header, written at once; then the returned record: the
     // header again (no verdict) or the verdict, which ends the test.
