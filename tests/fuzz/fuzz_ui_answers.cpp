@@ -19,11 +19,14 @@
 // a listening test acknowledges exactly the answer it passes.
 #include <fcntl.h>
 #include <poll.h>
+#include <linux/sockios.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
@@ -31,6 +34,7 @@
 #include <filesystem>
 #include <fstream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "FuzzCheck.h"
@@ -124,10 +128,12 @@ Script parseScript(const uint8_t *d, size_t n) {
 
 // The UI server is played in the test's own thread: whenever the test is about
 // to wait (every wait of the panel is a poll), the server first takes its next
-// steps. Loopback delivers at once, so the wait then finds what the server
-// sent, or finds that nothing will come: a wait that would only run out ends
-// at once and moves the panel's clock on by its length instead. No thread has
-// to be scheduled, no time passes, and each input runs the same way each time.
+// steps. The wait then finds what the server sent, or finds that nothing will
+// come: a wait that would only run out ends at once and moves the panel's
+// clock on by its length instead. Loopback usually delivers before send and
+// connect return, but a loaded machine leaves some of it to ksoftirqd, so
+// while anything may still be on its way (a connection, the request, bytes or
+// the close not yet acknowledged) the wait first lets real time pass.
 
 uint16_t serverPort, listenPort, deadPort;
 int listenFd = -1;
@@ -182,7 +188,21 @@ public:
         return o_;
     }
 
+    // Something the test or the server waits for may still be on its way.
+    bool inFlight(const pollfd *fds, nfds_t n) const {
+        if (fd_ < 0) return !peer_;             // a client test's connection, not yet in the listener
+        if (o_.request.empty()) return true;    // the test's request or command (or its accept)
+        if (unacknowledged(fd_) > 0) return true;
+        for (nfds_t i = 0; i < n; ++i)
+            if ((fds[i].events & POLLOUT) || unacknowledged(fds[i].fd) > 0) return true;
+        return false;
+    }
+
 private:
+    static int unacknowledged(int fd) {
+        int n = 0;
+        return ::ioctl(fd, SIOCOUTQ, &n) == 0 ? n : 0;
+    }
     bool connect() {
         // A listening test is connected to (refused at once until it listens);
         // a client test's connection is taken from the listener.
@@ -228,6 +248,7 @@ private:
 };
 
 Server *server = nullptr;  // while a call under test runs
+constexpr int kSettleMs = 2000;  // real time for what is on its way
 bool inCall = false;
 int64_t clockSkewMs = 0;   // the waits that ran out, added to the panel's clock
 
@@ -241,15 +262,20 @@ bool startsWith(const std::string &s, const char *prefix) { return s.rfind(prefi
 
 }  // namespace
 
+extern "C" int64_t __real__Z10Wait_NowMsv();
 extern "C" int __real_poll(pollfd *fds, nfds_t n, int timeoutMs);
 extern "C" int __wrap_poll(pollfd *fds, nfds_t n, int timeoutMs) {
     if (!inCall) return __real_poll(fds, n, timeoutMs);
-    if (server) server->advance();
-    const int rc = __real_poll(fds, n, 0);
+    int rc;
+    for (const int64_t settleEnd = __real__Z10Wait_NowMsv() + kSettleMs;;) {
+        if (server) server->advance();
+        rc = __real_poll(fds, n, 0);
+        if (rc != 0 || !server || !server->inFlight(fds, n) || __real__Z10Wait_NowMsv() >= settleEnd) break;
+        std::this_thread::sleep_for(std::chrono::microseconds(50));
+    }
     if (rc == 0 && timeoutMs > 0) clockSkewMs += timeoutMs;
     return rc;
 }
-extern "C" int64_t __real__Z10Wait_NowMsv();
 extern "C" int64_t __wrap__Z10Wait_NowMsv() { return __real__Z10Wait_NowMsv() + clockSkewMs; }
 
 extern "C" int LLVMFuzzerInitialize(int *, char ***) {
