@@ -323,6 +323,9 @@ extern "C" int LLVMFuzzerInitialize(int *, char ***) {
     strict = s != nullptr && *s == '1';
     const char *v = std::getenv("FUZZ_PRINT_CHANNEL_VERBOSE");
     verbose = v != nullptr && *v == '1';
+    // The firmware type a header names goes to standard output: not the
+    // fuzzer's business, and megabytes of it in a long run's log.
+    if (!std::freopen("/dev/null", "w", stdout)) fail("no /dev/null");
     probes::MakeShellFiles();
     USBPrint_SetDelivery(&kJava);
     if (USBAdapter_AllocateReadBuffers() != 1) fail("the reader's buffers cannot be allocated");
