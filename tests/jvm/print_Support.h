@@ -44,11 +44,6 @@ inline mfp_notif_t Notification(U8 code) {
     return n;
 }
 
-// Waits until `job` holds `bytes` bytes.
-inline bool AwaitJobBytes(int job, long long bytes, int ms = 10000) {
-    return WaitUntil([&] { return fixtures::JobCount() > job && fixtures::JobByteCount(job) == bytes; }, ms);
-}
-
 // USBPrintDrvClose on a thread of its own, as the Java service calls it. The
 // reader's idle poll is cut short once the close has asked it to park.
 inline jint Hibernate(jobject service) {
