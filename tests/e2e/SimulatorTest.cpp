@@ -6,9 +6,9 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstdlib>
 #include <filesystem>
-#include <random>
 #include <regex>
 #include <sstream>
 #include <string>
@@ -16,29 +16,29 @@
 
 #include "Sha256.h"
 #include "support/Bytes.h"
+#include "support/RandomBytes.h"
+#include "support/Uel.h"
 
 namespace {
 
 namespace fs = std::filesystem;
 
-const std::string kUel = "\x1b%-12345X";
-
 // Print data as a driver makes it: no ESC, so no stray selector or UEL.
 std::string PrintData(size_t n, unsigned seed) {
-    std::mt19937 gen(seed);
-    std::string s(n, '\0');
-    for (char &c : s) {
-        const char v = static_cast<char>(gen() & 0xFF);
-        c = v == '\x1b' ? 'E' : v;
-    }
+    std::string s = RandomBytes(n, seed);
+    std::replace(s.begin(), s.end(), '\x1b', 'E');
     return s;
 }
 
-std::string UelJob(const std::string &body) { return kUel + "@PJL ENTER LANGUAGE=PCL\r\n" + body + kUel; }
+std::string UelJob(const std::string &body) { return Framed("@PJL ENTER LANGUAGE=PCL\r\n" + body); }
+
+std::string Sample(const std::string &name) {
+    return std::string(USBADAPTER_SOURCE_DIR) + "/tools/sim/samples/" + name + ".sim";
+}
 
 // One journal line; a string or number field by name ("" when absent).
 struct Event {
-    std::string src, event, line;
+    std::string line;
     std::string operator[](const std::string &key) const {
         std::smatch m;
         if (!std::regex_search(line, m, std::regex("\"" + key + "\":(\"([^\"]*)\"|(-?[0-9]+|true|false))")))
@@ -85,19 +85,14 @@ protected:
         return Run(extra);
     }
 
-    std::vector<Event> Journal() const {
-        std::vector<Event> events;
-        std::istringstream in(ReadFile(Out("session.jsonl")));
-        for (std::string line; std::getline(in, line);) {
-            Event e{"", "", line};
-            events.push_back({e["src"], e["event"], line});
-        }
-        return events;
-    }
+    // The session journal's events of `src` named `event`, in order.
     std::vector<Event> Events(const std::string &src, const std::string &event) const {
         std::vector<Event> out;
-        for (const Event &e : Journal())
-            if (e.src == src && e.event == event) out.push_back(e);
+        std::istringstream in(ReadFile(Out("session.jsonl")));
+        for (std::string line; std::getline(in, line);) {
+            const Event e{line};
+            if (e["src"] == src && e["event"] == event) out.push_back(e);
+        }
         return out;
     }
 
@@ -236,8 +231,7 @@ TEST_F(Simulator, SampleSessionsPass) {
     } samples[] = {{"session", 11, 7}, {"scan", 15, 1}, {"firmware", 8, 2}};
     for (const auto &sample : samples) {
         SCOPED_TRACE(sample.name);
-        ASSERT_EQ(Run({"--script", std::string(USBADAPTER_SOURCE_DIR) + "/tools/sim/samples/" + sample.name + ".sim"}),
-                  0);
+        ASSERT_EQ(Run({"--script", Sample(sample.name)}), 0);
         EXPECT_EQ(Events("sim", "expect").size(), sample.expects);
         const auto ends = Events("java", "job-end");
         ASSERT_EQ(ends.size(), sample.jobs);
@@ -253,9 +247,7 @@ TEST_F(Simulator, SampleSessionsPass) {
 // answers reach the host; hibernation and wake leave printing whole.
 TEST_F(Simulator, IdentitySampleShowsTheConfiguredModel) {
     const std::string model = "tw-m4020CDN Office";
-    ASSERT_EQ(Run({"--script", std::string(USBADAPTER_SOURCE_DIR) + "/tools/sim/samples/identity.sim", "--model",
-                   model}),
-              0);
+    ASSERT_EQ(Run({"--script", Sample("identity"), "--model", model}), 0);
     auto view = Events("sim", "host-view").at(0);
     EXPECT_EQ(view["ids"], "0x2f3a:0x0121 lang 0x0409");
     EXPECT_EQ(view["productSize"], std::to_string(model.size() + 1));
