@@ -1,11 +1,10 @@
 // Command lines per second through the MAA shell's lexer, parser and evaluator,
 // for a mix of assignments, arithmetic and calls of a registered no-op
 // function. Baselines in the same run: tokenising the same lines only, and
-// running an empty line.
+// running an empty line (lines per second of each, and their ratios).
 #include <benchmark/benchmark.h>
 
-#include <cstdlib>
-
+#include "RatioReporter.h"
 #include "maa/MAA_Address.h"
 #include "maa/MAA_IF.h"
 #include "maa/MAA_MM.h"
@@ -90,11 +89,10 @@ BENCHMARK(BM_Lines);
 }  // namespace
 
 int main(int argc, char **argv) {
-    // The shell logs every line; measure formatting, not terminal output.
-    setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
-    benchmark::Initialize(&argc, argv);
-    if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
-    benchmark::RunSpecifiedBenchmarks();
-    benchmark::Shutdown();
+    if (!RatioReporter::Initialize(&argc, argv, 9)) return 1;
+    RatioReporter reporter;
+    reporter.Compare("BM_Lines", "BM_LexOnly", "items_per_second");
+    reporter.Compare("BM_Lines", "BM_EmptyLine", "items_per_second");
+    reporter.RunAll();
     return 0;
 }

@@ -174,7 +174,6 @@ BENCHMARK(BM_ChannelFileTcp)->Arg(1 << 20)->Arg(16 << 20)->Unit(benchmark::kMill
 }  // namespace
 
 int main(int argc, char **argv) {
-    ::setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
     // fw.bin goes to the working directory.
     char tmpl[] = "/tmp/usbadapter-bench-fw-XXXXXX";
     const char *dir = ::mkdtemp(tmpl);
@@ -184,8 +183,7 @@ int main(int argc, char **argv) {
     for (const char *baseline : {"BM_LoopbackTcp/", "BM_ChannelFileTcp/"})
         for (int size : {1 << 20, 16 << 20})
             reporter.Compare("BM_FirmwareHandoff/" + std::to_string(size), baseline + std::to_string(size));
-    benchmark::RunSpecifiedBenchmarks(&reporter);
-    reporter.PrintRatios();
+    reporter.RunAll();
     if (dir) std::filesystem::remove_all(dir);
     return 0;
 }

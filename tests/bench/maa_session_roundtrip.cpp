@@ -7,7 +7,6 @@
 #include <unistd.h>
 
 #include <atomic>
-#include <cstdlib>
 #include <string>
 #include <thread>
 
@@ -136,15 +135,11 @@ BENCHMARK(BM_Download_Shell)->Arg(64 << 10)->Arg(1 << 20)->UseRealTime();
 }  // namespace
 
 int main(int argc, char **argv) {
-    // The shell logs as it goes; measure the session, not terminal output.
-    setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
     if (!RatioReporter::Initialize(&argc, argv, 9)) return 1;
     RatioReporter reporter;
     reporter.Compare("BM_RoundTrip_Shell", "BM_RoundTrip_Raw");
     reporter.Compare("BM_Download_Shell/65536", "BM_Download_Raw/65536");
     reporter.Compare("BM_Download_Shell/1048576", "BM_Download_Raw/1048576");
-    benchmark::RunSpecifiedBenchmarks(&reporter);
-    reporter.PrintRatios();
-    benchmark::Shutdown();
+    reporter.RunAll();
     return 0;
 }

@@ -20,7 +20,6 @@
 #include <atomic>
 #include <chrono>
 #include <cstdio>
-#include <cstdlib>
 #include <string>
 #include <thread>
 #include <vector>
@@ -220,7 +219,6 @@ const int64_t kTransferSizes[] = {4 << 10, 64 << 10, 1 << 20};
 }  // namespace
 
 int main(int argc, char **argv) {
-    setenv("USBADAPTER_LOG_LEVEL", "OFF", 0);
     if (!RatioReporter::Initialize(&argc, argv, 15)) return 1;
     gJob = MakeJob();
     StartService();
@@ -237,9 +235,7 @@ int main(int argc, char **argv) {
         reporter.Compare("BM_PrintPath" + arg, "BM_BareChannel" + arg);
         reporter.Compare("BM_PrintPath" + arg, "BM_BareChannel" + arg, "reader_cpu_bytes_per_second");
     }
-    benchmark::RunSpecifiedBenchmarks(&reporter);
-    reporter.PrintRatios();
-    benchmark::Shutdown();
+    reporter.RunAll();
     RemoveQueues(*gRoot);
     delete gRoot;
     std::fflush(nullptr);
