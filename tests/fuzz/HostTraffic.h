@@ -6,6 +6,8 @@
 #include <string_view>
 #include <vector>
 
+#include "vdev.h"
+
 // The pieces of `s` between the separators `sep` (always at least one).
 inline std::vector<std::string> Split(std::string_view s, std::string_view sep) {
     std::vector<std::string> out;
@@ -31,4 +33,10 @@ inline std::vector<Phase> SplitPhases(std::string_view d, std::string &all) {
         out.push_back(std::move(transfers));
     }
     return out;
+}
+
+// The host sends phases[next] on the print node, a host write per transfer.
+inline void SendNextPhase(const std::vector<Phase> &phases, size_t &next) {
+    for (const std::string &t : phases[next]) vdev::HostWrite(vdev::kPrn, t.data(), t.size());
+    ++next;
 }

@@ -54,11 +54,6 @@ bool pulled = false;
 int pollsAfterPull = 0;
 bool active = false;  // only the session's polls are the host's business
 
-void sendNextPhase() {
-    for (const std::string &t : phases[nextPhase]) vdev::HostWrite(vdev::kPrn, t.data(), t.size());
-    ++nextPhase;
-}
-
 // The host's view of one wait of the device: it sends the next phase, or pulls
 // the cable when it has nothing left.
 void onPoll() {
@@ -74,7 +69,7 @@ void onPoll() {
     // Separators in a row make one pause, not a time-out per pair.
     while (nextPhase < phases.size() && phases[nextPhase].empty()) ++nextPhase;
     if (nextPhase < phases.size()) {
-        sendNextPhase();
+        SendNextPhase(phases, nextPhase);
         idle = 0;
         return;
     }
@@ -125,7 +120,7 @@ void runSession(std::string_view traffic) {
     maa_session::slPollTimeout = MAA_POLL_TIMEOUT_FIRST;
     enSpecialMode = MAA_NORMAL_CMD;
     MAA_SetResultWriter(nullptr);
-    sendNextPhase();
+    SendNextPhase(phases, nextPhase);
 
     // The classifier's command buffer, exactly as long as a hand-back may be.
     std::vector<U8> command(HDR_CMD_LEN, 0);

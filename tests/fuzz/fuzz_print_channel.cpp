@@ -166,12 +166,6 @@ Clock::time_point turnStart;
 bool strict = false;
 bool verbose = false;
 
-// With hostMu held.
-void sendNextPhase() {
-    for (const std::string &t : phases[nextPhase]) vdev::HostWrite(vdev::kPrn, t.data(), t.size());
-    ++nextPhase;
-}
-
 // The host's patience: it sends the next phase when the device waits for
 // more, pulls the cable when it has nothing left to send, and reports a turn
 // that never returns. The reader looks itself before each poll or read of the
@@ -200,7 +194,7 @@ void hostLooks() {
     if (calls - base < kIdleCalls) return;
     base = calls;
     if (nextPhase < phases.size()) {
-        sendNextPhase();
+        SendNextPhase(phases, nextPhase);
         pending = vdev::PendingHostBytes(vdev::kPrn);
     } else if (!pulled) {
         if (strict) fail("the device waits for the host without bound (strict mode)");
@@ -346,7 +340,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     {
         std::lock_guard lk(hostMu);
         phases = std::move(parsed);  // cleanUp() has rewound the host
-        sendNextPhase();
+        SendNextPhase(phases, nextPhase);
     }
 
     // Turns until the host has sent everything and the device has taken it.
@@ -365,7 +359,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
         // The host's pause: a turn with nothing to take, then the next phase.
         readerTurn();
         std::lock_guard lk(hostMu);
-        if (nextPhase < phases.size()) sendNextPhase();
+        if (nextPhase < phases.size()) SendNextPhase(phases, nextPhase);
     }
 
     // The host is gone or quiet for good: what is open must end.
