@@ -41,13 +41,19 @@ serve() {
     sim_bg "$1" serve
     until_link "$1/prn" "print channel"
 }
-# stop OUT: SIGTERM to the session; it must end with status 0.
-stop() {
-    kill -TERM "$pid"
+# reap OUT: waits for the simulator, shows its output (JNI complaints in it
+# fail the test) and wants status 0.
+reap() {
     wait "$pid"
     local status=$?
     pid=
-    [ $status -eq 0 ] || fail "the simulator ended with status $status: $(cat "$1.txt")"
+    cat "$1.txt"
+    [ $status -eq 0 ] || fail "the simulator ended with status $status"
+}
+# stop OUT: SIGTERM to the session, then reap OUT.
+stop() {
+    kill -TERM "$pid"
+    reap "$1"
 }
 # pass: removes the work directory.
 pass() {

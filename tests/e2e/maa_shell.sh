@@ -8,12 +8,10 @@ tool=$2
 name=maa
 . "$(dirname "$0")/common.sh"
 samples=$(dirname "$0")/../../tools/sim/samples
-# run_sample NAME OUT: a sample session in the foreground; it must pass.
+# run_sample NAME OUT: a sample session; it must pass.
 run_sample() {
-    "$sim" --out "$2" --timeout 8000 --script "$samples/$1.sim" >"$2.txt" 2>&1
-    local status=$?
-    cat "$2.txt"
-    [ $status -eq 0 ] || fail "$1 session: exit status $status"
+    sim_bg "$2" --script "$samples/$1.sim"
+    reap "$2"
 }
 # with_tool OUT ARGS...: the host tool with ARGS on a simulator's pseudo-terminal
 # (tool output in OUT.tool); both must end with status 0.
@@ -24,12 +22,9 @@ with_tool() {
     until_link "$dir/prn" "pseudo-terminal"
     "$tool" "$@" "$dir/prn" >"$out.tool" 2>"$out.err"
     local status=$?
-    wait $pid
-    local simStatus=$?
-    pid=
-    cat "$out.tool" "$out.err" "$out.txt"
+    cat "$out.tool" "$out.err"
     [ $status -eq 0 ] || fail "usbadapter-shell $*: exit status $status"
-    [ $simStatus -eq 0 ] || fail "simulator with usbadapter-shell $*: exit status $simStatus"
+    reap "$out"
 }
 
 # The sample session: a path downloaded with its last letter wrong, corrected
