@@ -51,9 +51,8 @@ void BM_FirmwareHandoff(benchmark::State &state) {
     const size_t size = static_cast<size_t>(state.range(0));
     const std::string body = RandomBytes(size, 7), header = fwpack::Header("E7", static_cast<uint32_t>(size));
     peers::UpdateManagerSim manager;
-    peers::UmOptions o;
     std::string error;
-    if (!manager.Start(o, &error)) {
+    if (!manager.Start({}, &error)) {
         state.SkipWithError(error.c_str());
         return;
     }

@@ -151,15 +151,14 @@ std::string MakeJob() {
     return Framed(pjl + body);
 }
 
-// Host writes of the job in transfers of `size`; returns when `done` holds,
-// polled every 100 us (both paths alike). Seconds.
-template <typename Done>
-double SendJob(const char *path, size_t size, Done done) {
+// Host writes of the job in transfers of `size`; returns when the reader
+// `tid` has drained `path`, polled every 100 us (both paths alike). Seconds.
+double SendJob(const char *path, size_t size, pid_t tid) {
     const auto start = std::chrono::steady_clock::now();
     for (size_t off = 0; off < gJob.size(); off += size)
         vdev::HostWrite(path, gJob.data() + off, std::min(size, gJob.size() - off));
     const auto deadline = start + std::chrono::seconds(60);
-    while (!done()) {
+    while (!Drained(path, tid)) {
         if (std::chrono::steady_clock::now() > deadline) Fail("a job did not get through within 60 s");
         std::this_thread::sleep_for(std::chrono::microseconds(100));
     }
@@ -202,7 +201,7 @@ void RunJobs(benchmark::State &state, const char *path, const sim::ServiceThread
     double cpu = 0;
     for (auto _ : state) {
         const double cpuStart = ThreadCpuSeconds(tid);
-        state.SetIterationTime(SendJob(path, size, [path, tid] { return Drained(path, tid); }));
+        state.SetIterationTime(SendJob(path, size, tid));
         cpu += ThreadCpuSeconds(tid) - cpuStart;
         if (reader.returned) Fail("a reader returned: " + reader.exception);
     }
