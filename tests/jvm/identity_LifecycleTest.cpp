@@ -1,7 +1,8 @@
 // The print reader inside a real JVM as the Java service drives it: close,
-// re-open, configuration check and cable pulls around jobs in progress, a job
-// too large for any buffer, and the serial number the reader takes from the
-// print daemon. Framing and classification are the reader's unit tests.
+// re-open, configuration check and cable pulls around jobs in progress, and
+// the serial number the reader takes from the print daemon. Framing,
+// classification and large jobs are the reader's unit tests; the soak sends
+// transfers of up to one read through Java.
 #include <dlfcn.h>
 
 #include <gtest/gtest.h>
@@ -13,7 +14,6 @@
 #include "maa/MAA_Types.h"
 #include "print_Support.h"
 #include "support/Bytes.h"
-#include "support/RandomBytes.h"
 
 namespace {
 
@@ -152,24 +152,6 @@ TEST_F(Lifecycle, HibernationRacingWithJobsLosesOnlyTheCutJob) {
     EXPECT_LE(cut, kRounds) << "only a job open at a close is cut";
     for (int i = 0; i < kJobs; ++i)
         EXPECT_NE(all.find("job " + std::to_string(i) + ";"), std::string::npos) << "job " << i << " lost";
-}
-
-TEST_F(Lifecycle, FortyMebibyteJobInMebibyteTransfersArrivesWhole) {
-    StartReader();
-    if (HasFatalFailure()) return;
-    LoggerHost_StopCapture();
-    const std::string stream = Framed(RandomBytes((40u << 20) - 2 * kUel.size(), 1234));
-    std::string sent;
-    for (size_t at = 0; at < stream.size(); at += 1u << 20) {
-        std::string t = stream.substr(at, 1u << 20);
-        if (at > 0 && t[0] == '\x1b') t[0] = 'A';  // a transfer starting with ESC would be classified
-        sent += t;
-        vdev::HostWrite(vdev::kPrn, t);
-    }
-    ASSERT_TRUE(fixtures::AwaitJobEnded(0, 60000));
-    EXPECT_EQ(fixtures::JobCount(), 1);
-    EXPECT_TRUE(fixtures::JobBytes(0) == sent) << fixtures::JobByteCount(0) << " bytes delivered, " << sent.size()
-                                               << " sent";
 }
 
 // ---- the serial number the host sees -------------------------------------------------

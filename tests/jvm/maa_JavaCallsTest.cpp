@@ -9,6 +9,7 @@
 
 #include <atomic>
 #include <list>
+#include <optional>
 
 #include "maa/MAA_Types.h"
 #include "print_Hidden.h"
@@ -19,36 +20,26 @@ namespace {
 
 using namespace maarec;
 
-// The library's shell functions, found once Java has loaded it (a missing one
-// fails the test).
+// The library's shell functions, looked up on construction once Java has
+// loaded the library (a missing one fails the test).
 struct Shell {
     using Fn1 = TMAAResult *(U32);
-    void (*SetResultWriter)(void (*)(const TMAAResult *)) = nullptr;
-    void (*SetCmdString)(const U8 *) = nullptr;
-    void (*SetCmdName)(const U8 *) = nullptr;
-    void (*SetMachineName)(const char *) = nullptr;
-    U32 (*AddrMap)(void *, U32) = nullptr;
-    TMAAResult *(*General)(U32, U32 *) = nullptr;
-    TMAAResult *(*StrIFOpt2)(U32, U32) = nullptr;
-    TMAAResult *(*SetUIEnable)() = nullptr;
-    Fn1 *PBAStrIFOpt1 = nullptr, *ImgStbStart = nullptr, *FTCATest = nullptr, *CheckCPUTemperature = nullptr;
-
-    void Load() {
-        using hidden::Function;
-        using Writer = void (*)(const TMAAResult *);
-        SetResultWriter = Function<void(Writer)>("MAA_SetResultWriter(void (*)(TMAAResult const*))");
-        SetCmdString = Function<void(const U8 *)>("MAA_SetCmdString(unsigned char const*)");
-        SetCmdName = Function<void(const U8 *)>("MAA_SetCmdName(unsigned char const*)");
-        SetMachineName = Function<void(const char *)>("MAA_SetMachineName(char const*)");
-        AddrMap = Function<U32(void *, U32)>("MAA_AddrMap(void*, unsigned int)");
-        General = Function<TMAAResult *(U32, U32 *)>("MAA_GENERAL_FUNCTION(unsigned int, unsigned int*)");
-        StrIFOpt2 = Function<TMAAResult *(U32, U32)>("Eng_MaaStrIFOpt2(unsigned int, unsigned int)");
-        SetUIEnable = Function<TMAAResult *()>("SetUIEnable()");
-        PBAStrIFOpt1 = Function<Fn1>("Eng_MaaPBAStrIFOpt1(unsigned int)");
-        ImgStbStart = Function<Fn1>("Eng_MaaImgStbStart(unsigned int)");
-        FTCATest = Function<Fn1>("Eng_MaaStrFTCATest(unsigned int)");
-        CheckCPUTemperature = Function<Fn1>("CheckCPUTemperature(unsigned int)");
-    }
+    using Writer = void (*)(const TMAAResult *);
+    void (*SetResultWriter)(Writer) =
+        hidden::Function<void(Writer)>("MAA_SetResultWriter(void (*)(TMAAResult const*))");
+    void (*SetCmdString)(const U8 *) = hidden::Function<void(const U8 *)>("MAA_SetCmdString(unsigned char const*)");
+    void (*SetCmdName)(const U8 *) = hidden::Function<void(const U8 *)>("MAA_SetCmdName(unsigned char const*)");
+    void (*SetMachineName)(const char *) = hidden::Function<void(const char *)>("MAA_SetMachineName(char const*)");
+    U32 (*AddrMap)(void *, U32) = hidden::Function<U32(void *, U32)>("MAA_AddrMap(void*, unsigned int)");
+    TMAAResult *(*General)(U32, U32 *) =
+        hidden::Function<TMAAResult *(U32, U32 *)>("MAA_GENERAL_FUNCTION(unsigned int, unsigned int*)");
+    TMAAResult *(*StrIFOpt2)(U32, U32) =
+        hidden::Function<TMAAResult *(U32, U32)>("Eng_MaaStrIFOpt2(unsigned int, unsigned int)");
+    TMAAResult *(*SetUIEnable)() = hidden::Function<TMAAResult *()>("SetUIEnable()");
+    Fn1 *PBAStrIFOpt1 = hidden::Function<Fn1>("Eng_MaaPBAStrIFOpt1(unsigned int)");
+    Fn1 *ImgStbStart = hidden::Function<Fn1>("Eng_MaaImgStbStart(unsigned int)");
+    Fn1 *FTCATest = hidden::Function<Fn1>("Eng_MaaStrFTCATest(unsigned int)");
+    Fn1 *CheckCPUTemperature = hidden::Function<Fn1>("CheckCPUTemperature(unsigned int)");
 };
 
 // The reader waits on its queue with the daemon as globalPrintObj and leaves
@@ -59,13 +50,13 @@ protected:
         PrintJvmTest::SetUp();
         StartReader(Daemon(), false);
         if (HasFatalFailure()) return;
-        sh.Load();
+        sh.emplace();
         ASSERT_FALSE(HasFailure());
-        sh.SetResultWriter(&Capture);
-        sh.SetMachineName("x86_64");
+        sh->SetResultWriter(&Capture);
+        sh->SetMachineName("x86_64");
     }
     void TearDown() override {
-        if (sh.SetResultWriter) sh.SetResultWriter(nullptr);
+        if (sh && sh->SetResultWriter) sh->SetResultWriter(nullptr);
         PrintJvmTest::TearDown();
     }
     virtual const char *Daemon() const { return fixtures::kRecordingDaemon; }
@@ -74,15 +65,15 @@ protected:
     void Command(const std::string &line, const std::string &name) {
         command_ = line;
         name_ = name;
-        sh.SetCmdString(reinterpret_cast<const U8 *>(command_.c_str()));
-        sh.SetCmdName(reinterpret_cast<const U8 *>(name_.c_str()));
+        sh->SetCmdString(reinterpret_cast<const U8 *>(command_.c_str()));
+        sh->SetCmdName(reinterpret_cast<const U8 *>(name_.c_str()));
         written.clear();
         fixtures::Reset();
         LoggerHost_StartCapture();
     }
     U32 Map(const std::string &text) {
         std::string &kept = texts_.emplace_back(text);
-        return sh.AddrMap(kept.data(), static_cast<U32>(kept.size() + 1));
+        return sh->AddrMap(kept.data(), static_cast<U32>(kept.size() + 1));
     }
     // Records written at once, then the returned one; and no exception left.
     static Recs Seen(const TMAAResult *returned) {
@@ -96,10 +87,10 @@ protected:
         return Seen(call());
     }
     Recs Temperature(U32 mode) {
-        return HostSees([&] { return sh.CheckCPUTemperature(mode); });
+        return HostSees([&] { return sh->CheckCPUTemperature(mode); });
     }
 
-    Shell sh;
+    std::optional<Shell> sh;
     std::string command_, name_;
     std::list<std::string> texts_;
 };
@@ -140,7 +131,7 @@ TEST_F(MaaJvm, CpuTemperatureJavaFailuresEndTheTestAndAreCleared) {
 }
 
 TEST_F(MaaJvm, PanelSetUIEnableTakesTheServiceReplyAsTheVerdictAndJavaFailuresEndInFailed) {
-    const auto call = [this] { return sh.SetUIEnable(); };
+    const auto call = [this] { return sh->SetUIEnable(); };
     const Rec header = Cont("[ SetUIEnable ]");
     EXPECT_EQ(HostSees(call), (Recs{header, End("SetUIEnable = OK")}));
     fixtures::SetReply("maaSetUIEnable", "panel on");
@@ -180,7 +171,7 @@ TEST_F(MaaJvm, EngineCommandReachesItsJavaMethodAndTheReplyComesBack) {
         fixtures::SetReply(c.method, c.reply);
         Recs want{Cont("[ GetData ]")};
         want.insert(want.end(), c.seen.begin(), c.seen.end());
-        EXPECT_EQ(Seen(c.call(sh)), want);
+        EXPECT_EQ(Seen(c.call(*sh)), want);
         EXPECT_EQ(fixtures::EventLines(), std::vector<std::string>{std::string(c.method) + ":GetData(7,\"x y\")"});
         EXPECT_EQ(LoggerHost_Count("[" + std::string(c.logName) + "] Start===>(GetData(7,\"x y\"))(GetData)\n"), 1);
     }
@@ -188,7 +179,7 @@ TEST_F(MaaJvm, EngineCommandReachesItsJavaMethodAndTheReplyComesBack) {
 
 TEST_F(MaaJvm, HostBytesThatAreNoModifiedUtf8ReachJavaAsQuestionMarks) {
     Command("GetData(\"\xff\xc3\xa9\xc0\x80\")", "GetData");
-    EXPECT_EQ(Seen(sh.StrIFOpt2(0, 0)).back().data, "NG: no engine");
+    EXPECT_EQ(Seen(sh->StrIFOpt2(0, 0)).back().data, "NG: no engine");
     EXPECT_EQ(fixtures::EventLines(), std::vector<std::string>{"maaEngMaaStrNormalTest:GetData(\"?\xc3\xa9??\")"});
 }
 
@@ -207,9 +198,9 @@ TEST_F(MaaJvm, EngineFailuresEndWithTheirTextsAndLeaveNoException) {
     for (const Case &c : cases) {
         SCOPED_TRACE(c.verdict);
         Command("GetData(1,2)", "GetData");
-        if (!c.command) sh.SetCmdString(nullptr);
+        if (!c.command) sh->SetCmdString(nullptr);
         c.fail();
-        EXPECT_EQ(Seen(sh.StrIFOpt2(1, 2)), (Recs{Cont("[ GetData ]"), End(c.verdict)}));
+        EXPECT_EQ(Seen(sh->StrIFOpt2(1, 2)), (Recs{Cont("[ GetData ]"), End(c.verdict)}));
         if (c.logged) { EXPECT_EQ(LoggerHost_Count(c.logged), 1); }
         EXPECT_EQ(fixtures::Calls("maaEngMaaStrNormalTest"), c.calls);
     }
@@ -232,7 +223,7 @@ TEST_F(MaaJvmWithoutUpcalls, EveryCallFailsCleanly) {
     for (const Case &c : cases) {
         SCOPED_TRACE(c.logged);
         Command("ImageStablization(1)", "ImageStablization");
-        EXPECT_EQ(Seen(c.call(sh)), c.seen);
+        EXPECT_EQ(Seen(c.call(*sh)), c.seen);
         EXPECT_TRUE(LoggerHost_Contains(c.logged));
     }
 }
@@ -249,7 +240,7 @@ TEST_F(MaaJvm, GeneralFunctionPassesIdAndArgumentTextsAndSendsTheReplyByItsPrefi
         Command("MyFunc(...)", "MyFunc");
         fixtures::SetReply("runUsbFunctionCall", c.reply);
         std::vector<U32> args = c.args;
-        EXPECT_EQ(Seen(sh.General(static_cast<U32>(args.size()), args.data())), c.seen);
+        EXPECT_EQ(Seen(sh->General(static_cast<U32>(args.size()), args.data())), c.seen);
         EXPECT_EQ(fixtures::EventLines(), std::vector<std::string>{"runUsbFunctionCall:MyFunc:" + c.journaled});
     }
 }
@@ -264,7 +255,7 @@ TEST_F(MaaJvm, GeneralFunctionRefusesBadArgumentsWithoutCallingJava) {
         SCOPED_TRACE(c.what);
         Command("MyFunc(...)", "MyFunc");
         std::vector<U32> args = c.args;
-        EXPECT_EQ(sh.General(static_cast<U32>(args.size()), args.data()), nullptr);
+        EXPECT_EQ(sh->General(static_cast<U32>(args.size()), args.data()), nullptr);
         EXPECT_EQ(Seen(nullptr), Recs{});
         EXPECT_EQ(fixtures::Calls("runUsbFunctionCall"), 0);
     }
@@ -273,24 +264,24 @@ TEST_F(MaaJvm, GeneralFunctionRefusesBadArgumentsWithoutCallingJava) {
 TEST_F(MaaJvm, GeneralFunctionWithoutAReplyLogsItAndEndsWithFailed) {
     U32 args[] = {5};
     Command("Unknown(5)", "Unknown");  // the service serves no such function: null
-    EXPECT_EQ(Seen(sh.General(1, args)), (Recs{End("Failed")}));
+    EXPECT_EQ(Seen(sh->General(1, args)), (Recs{End("Failed")}));
     EXPECT_EQ(LoggerHost_Count("Result string is NULL!\n"), 1);
     EXPECT_EQ(fixtures::EventLines(), std::vector<std::string>{"runUsbFunctionCall:Unknown:5"});
 
     Command("Unknown(5)", "Unknown");
     fixtures::ThrowOn("runUsbFunctionCall");
-    EXPECT_EQ(Seen(sh.General(1, args)), (Recs{End("Failed")}));
+    EXPECT_EQ(Seen(sh->General(1, args)), (Recs{End("Failed")}));
     EXPECT_EQ(LoggerHost_Count("Result string is NULL!\n"), 1);
 
     Command("SetUIEnable()", "SetUIEnable");  // the service's own answer
-    EXPECT_EQ(Seen(sh.General(0, args)), (Recs{End("SetUIEnable = OK")}));
+    EXPECT_EQ(Seen(sh->General(0, args)), (Recs{End("SetUIEnable = OK")}));
 
     // An MAA object without the method.
     auto *maaSlot = hidden::Variable<std::atomic<jobject>>("globalMAAObj");
     ASSERT_NE(maaSlot, nullptr);
     maaSlot->store(jvm::New(jvm::kPrintAndScanService));
     Command("Unknown(5)", "Unknown");
-    EXPECT_EQ(Seen(sh.General(1, args)), (Recs{End("Failed")}));
+    EXPECT_EQ(Seen(sh->General(1, args)), (Recs{End("Failed")}));
     EXPECT_EQ(LoggerHost_Count("[MAA] can't find runUsbFunctionCall()\n"), 1);
 }
 
