@@ -10,6 +10,8 @@ namespace {
 
 using Local = LocalRef<jobject>;
 
+constexpr const char *kSetReply = "(Ljava/lang/String;Ljava/lang/Object;)V";
+
 LocalRef<jstring> JStr(const std::string &text) { return jvm::Str(text.c_str()); }
 
 std::string StaticString(const char *name, const char *sig, jint arg = 0) {
@@ -26,11 +28,9 @@ std::string StaticBytes(const char *name, jint arg) {
 
 void Reset() { jvm::CallStaticVoid(kJournal, "reset", "()V"); }
 
-std::string Events() { return StaticString("events", "()Ljava/lang/String;"); }
-
 std::vector<std::string> EventLines() {
     std::vector<std::string> lines;
-    std::istringstream in(Events());
+    std::istringstream in(StaticString("events", "()Ljava/lang/String;"));
     for (std::string line; std::getline(in, line);) lines.push_back(line);
     return lines;
 }
@@ -47,8 +47,6 @@ bool AwaitCalls(const std::string &method, int count, int timeoutMs) {
 int JobCount() { return jvm::CallStaticInt(kJournal, "jobCount", "()I"); }
 
 std::string JobBytes(int job) { return StaticBytes("jobBytes", job); }
-
-long long JobByteCount(int job) { return jvm::CallStaticLong(kJournal, "jobByteCount", "(I)J", jint{job}); }
 
 bool JobEnded(int job) { return jvm::CallStaticBoolean(kJournal, "jobEnded", "(I)Z", jint{job}); }
 
@@ -80,12 +78,11 @@ void SetInterpreters(const std::vector<int> &ids) {
     LocalRef<jintArray> arr{env, env->NewIntArray(static_cast<jsize>(raw.size()))};
     if (!arr) return;
     env->SetIntArrayRegion(arr.get(), 0, static_cast<jsize>(raw.size()), raw.data());
-    jvm::CallStaticVoid(kJournal, "setInterpreters", "([I)V", arr.get());
+    jvm::CallStaticVoid(kJournal, "setReply", kSetReply, JStr("getInstalledInterpreter").get(), arr.get());
 }
 
 void SetReply(const std::string &method, const std::string &reply) {
-    jvm::CallStaticVoid(kJournal, "setReply", "(Ljava/lang/String;Ljava/lang/String;)V", JStr(method).get(),
-                        JStr(reply).get());
+    jvm::CallStaticVoid(kJournal, "setReply", kSetReply, JStr(method).get(), JStr(reply).get());
 }
 
 void SetIntReply(const std::string &method, int reply) {
@@ -93,8 +90,7 @@ void SetIntReply(const std::string &method, int reply) {
 }
 
 void SetBytesReply(const std::string &method, const std::string &bytes) {
-    jvm::CallStaticVoid(kJournal, "setBytesReply", "(Ljava/lang/String;[B)V", JStr(method).get(),
-                        jvm::ByteArray(bytes).get());
+    jvm::CallStaticVoid(kJournal, "setReply", kSetReply, JStr(method).get(), jvm::ByteArray(bytes).get());
 }
 
 }  // namespace fixtures

@@ -23,15 +23,13 @@ inline constexpr const char *kJournal = "com/tarnwel/vbk/ca/plugin/usbadapter/pr
 void Reset();
 
 // ---- reading back ----
-std::string Events();                  // every event line, each ending in '\n'
-std::vector<std::string> EventLines();  // the same, split
+std::vector<std::string> EventLines();  // every event line
 int Calls(const std::string &method);  // times the call-back was made (also when it threw)
 // Waits (real time) until `method` was called `count` times; false on time-out.
 bool AwaitCalls(const std::string &method, int count, int timeoutMs);
 
 int JobCount();
 std::string JobBytes(int job);            // all chunks kept, joined
-long long JobByteCount(int job);
 bool JobEnded(int job);                   // fileParsingStatus was set to 1
 bool AwaitJobEnded(int job, int timeoutMs);
 

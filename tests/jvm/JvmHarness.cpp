@@ -189,7 +189,6 @@ LocalRef<jbyteArray> ByteArray(const std::string &bytes) {
     }
 JVM_INSTANCE_CALL(jint, CallInt, CallIntMethodV, jint{0})
 JVM_STATIC_CALL(jint, CallStaticInt, CallStaticIntMethodV, jint{0})
-JVM_STATIC_CALL(jlong, CallStaticLong, CallStaticLongMethodV, jlong{0})
 JVM_STATIC_CALL(jboolean, CallStaticBoolean, CallStaticBooleanMethodV, jboolean{JNI_FALSE})
 JVM_STATIC_CALL(jobject, CallStaticObject, CallStaticObjectMethodV, jobject{})
 

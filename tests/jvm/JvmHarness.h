@@ -62,7 +62,6 @@ jint CallInt(jobject obj, const char *name, const char *sig, ...);
 // references of the calling thread.
 void CallStaticVoid(const char *cls, const char *name, const char *sig, ...);
 jint CallStaticInt(const char *cls, const char *name, const char *sig, ...);
-jlong CallStaticLong(const char *cls, const char *name, const char *sig, ...);
 jboolean CallStaticBoolean(const char *cls, const char *name, const char *sig, ...);
 jobject CallStaticObject(const char *cls, const char *name, const char *sig, ...);
 

@@ -226,7 +226,7 @@ protected:
         const bool ended = cut == Cut::None ? fixtures::AwaitJobEnded(job_, 20000)
                                             : NudgeUntil([&] { return fixtures::AwaitJobEnded(job_, 0); });
         ASSERT_TRUE(ended)
-            << how << ": job " << total_ << " did not end (" << fixtures::JobByteCount(job_) << " of " << want.size()
+            << how << ": job " << total_ << " did not end (" << fixtures::JobBytes(job_).size() << " of " << want.size()
             << " bytes)";
         const std::string got = fixtures::JobBytes(job_);
         const bool ok = cut == Cut::PullInFlight ? !got.empty() && want.compare(0, got.size(), got) == 0 : got == want;
