@@ -7,6 +7,7 @@
 
 #include <filesystem>
 #include <string>
+#include <vector>
 
 #include "JvmHarness.h"
 #include "LoggerHost.h"
@@ -44,23 +45,21 @@ protected:
 TEST_F(StartupEntries, CreateQueuesThenPostTheInitMessageOrLogWhatFailed) {
     const struct {
         const char *model;
-        const char *removed;  // under the root, before the call
-        const char *line;     // logged once
+        const char *removed;              // under the root, before the calls
+        std::vector<const char *> lines;  // logged once each
     } cases[] = {
-        {nullptr, nullptr, "[USBAdp] pubmodelName returns NULL\n"},
-        {"TW-4020 MFP", nullptr, "[USBAdp] Exit JNI_creatPrnScanMsgQs()\n"},
-        {"TW-4020 MFP", nullptr, "[USBAdp]Exit JNI_initDevice()\n"},
-        {"TW-4020 MFP", "/halvard/spool/tmp", "[USBAdp] Error in creating PrnScanMsgQs\n"},
-        {"TW-4020 MFP", "/halvard/spool/tmp", "[USBAdp][USB]Prn_msgQ message can't be send. \n"},
-        {"TW-4020 MFP", "/halvard/spool/tmp", "[USBAdp] Error in JNI_initDevice\n"},
+        {nullptr, nullptr, {"[USBAdp] pubmodelName returns NULL\n"}},
+        {"TW-4020 MFP", nullptr, {"[USBAdp] Exit JNI_creatPrnScanMsgQs()\n", "[USBAdp]Exit JNI_initDevice()\n"}},
+        {"TW-4020 MFP", "/halvard/spool/tmp", {"[USBAdp] Error in creating PrnScanMsgQs\n",
+         "[USBAdp][USB]Prn_msgQ message can't be send. \n", "[USBAdp] Error in JNI_initDevice\n"}},
     };
     for (const auto &c : cases) {
-        SCOPED_TRACE(c.line);
+        SCOPED_TRACE(c.lines.front());
         LoggerHost_StartCapture();
         RemoveQueues(root_);
         if (c.removed) std::filesystem::remove_all(root_ / c.removed);
         Start(c.model);
-        EXPECT_EQ(LoggerHost_Count(c.line), 1);
+        for (const char *line : c.lines) EXPECT_EQ(LoggerHost_Count(line), 1) << line;
         const bool made = c.model && !c.removed;
         EXPECT_EQ(LoggerHost_Contains("Exit JNI_"), made);
         EXPECT_EQ(std::filesystem::exists(root_ / kQueueKeyFile), made);

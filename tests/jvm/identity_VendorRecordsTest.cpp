@@ -5,7 +5,6 @@
 #include <atomic>
 #include <string>
 
-#include "common/JniUtil.h"
 #include "print_Support.h"
 
 namespace {
@@ -65,14 +64,12 @@ protected:
     }
     jobject Of(const char *cls) const { return cls == jvm::kPluginAdapter ? plugin_ : kivoro_; }
     // Calls `method(byte[])`; a null `bytes` passes null.
-    static LocalRef<jbyteArray> Array(const std::string &bytes) { return jvm::ByteArray(bytes); }
     void Call(jobject obj, const char *method, const std::string *bytes) {
-        jvm::CallVoid(obj, method, "([B)V", bytes ? Array(*bytes).get() : nullptr);
+        jvm::CallVoid(obj, method, "([B)V", bytes ? jvm::ByteArray(*bytes).get() : nullptr);
     }
     jint ScanEvent(const std::string &bytes, jint len) {
-        return jvm::CallInt(service_, "sendScanToPCEventData", "([BI)I", Array(bytes).get(), len);
+        return jvm::CallInt(service_, "sendScanToPCEventData", "([BI)I", jvm::ByteArray(bytes).get(), len);
     }
-    void ClosePrintChannel() { ASSERT_EQ(printjvm::Hibernate(service_), 1); }
     size_t DataBlocks() {
         size_t n = 0;
         for (const auto &r : vdev::VendorRecords()) n += r.bRequest == 0x0D && r.wValue == 1;
@@ -185,7 +182,7 @@ TEST_F(VendorRecords, CheckInTimeTellsTheLengthAndKeepsAtMost256Bytes) {
 }
 
 TEST_F(VendorRecords, ClosedChannelWritesTheStandardErrorLinesAndStagesNothing) {
-    ClosePrintChannel();
+    ASSERT_EQ(printjvm::Hibernate(service_), 1);
     const size_t before = vdev::VendorRecords().size();
     const std::string bytes = Pattern(2000);
     for (const Entry &e : kEntries) {
@@ -201,7 +198,7 @@ TEST_F(VendorRecords, ClosedChannelWritesTheStandardErrorLinesAndStagesNothing) 
     EXPECT_EQ(vdev::VendorRecords().size(), before);
 
     // The back channel writes nothing either.
-    jvm::CallVoid(service_, "sendBackChannelData", "([BI)V", Array("response").get(), 8);
+    jvm::CallVoid(service_, "sendBackChannelData", "([BI)V", jvm::ByteArray("response").get(), 8);
     EXPECT_TRUE(vdev::HostRead(vdev::kPrn).empty());
     EXPECT_TRUE(LoggerHost_Contains("[UsbAdp] [write] fdPrn <= 0"));
 }

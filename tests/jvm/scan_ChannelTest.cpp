@@ -109,8 +109,7 @@ TEST_F(ScanChannel, WhenJavaFailsTheHostGetsNoReplyAndTheNextRequestWorks) {
     EXPECT_EQ(Answer(vdev::kScan, kSizeRequest), "");
     fixtures::ReturnNull("getCapXmlData");
     EXPECT_EQ(Answer(vdev::kScan, kDataRequest), "");
-    fixtures::ReturnNull("getCapXmlData", false);
-    EXPECT_EQ(Answer(vdev::kScan, Bytes({0x1B, 0x24, 0xF4, 0x07, 0, 0, 0, 0, 0, 0})), "");
+    fixtures::ReturnNull("getCapXmlData", false);  // the size is made from the data
     fixtures::ReturnNull("getPrintImage");
     testing::internal::CaptureStdout();
     EXPECT_EQ(Answer(vdev::kPrn, kImageRequest), "");
