@@ -37,10 +37,10 @@ inline void ReadPrintMsg(jobject daemon, jobject maa, const char *manufacturer, 
                   jvm::Str(deviceClass).get(), jint{1});
 }
 
-inline mfp_notif_t Notification(U8 code) {
+inline mfp_notif_t Notification(U8 code, S32 intf = eMfp_Notif_Prn) {
     mfp_notif_t n{};
     n.ub_notif = code;
-    n.ub_intf = eMfp_Notif_Prn;
+    n.ub_intf = intf;
     return n;
 }
 

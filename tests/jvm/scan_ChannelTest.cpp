@@ -31,10 +31,7 @@ protected:
         jobject scanService = jvm::New("java/lang/Object");
         jvm::StartDetached([daemon, scanService](JNIEnv *) { ReadScanMsg(daemon, scanService); }, "scan-reader");
         ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp Scan] Waiting for the scan events"); }));
-        mfp_notif_t both{};
-        both.ub_notif = MFP_DEV_CONFIGURED;
-        both.ub_intf = eMfp_Notif_Both;
-        vdev::QueueNotification(vdev::kPrn, both);
+        vdev::QueueNotification(vdev::kPrn, printjvm::Notification(MFP_DEV_CONFIGURED, eMfp_Notif_Both));
         ASSERT_TRUE(WaitUntil([] { return LoggerHost_Contains("[USBAdp Scan] Received MFP_DEV_CONFIGURED event"); }));
         ASSERT_TRUE(WaitUntil([] { return vdev::PollTimeouts(vdev::kPrn).size() >= 1; }));
     }
