@@ -106,7 +106,9 @@ TEST_F(ScanChannel, WhenJavaFailsTheHostGetsNoReplyAndTheNextRequestWorks) {
     EXPECT_EQ(Answer(vdev::kScan, kSizeRequest), "");
     fixtures::ReturnNull("getCapXmlData");
     EXPECT_EQ(Answer(vdev::kScan, kDataRequest), "");
-    fixtures::ReturnNull("getCapXmlData", false);  // the size is made from the data
+    fixtures::ReturnNull("getCapXmlData", false);
+    // Any other code is swallowed, even with Java ready to answer.
+    EXPECT_EQ(Answer(vdev::kScan, Bytes({0x1B, 0x24, 0xF4, 0x07, 0, 0, 0, 0, 0, 0})), "");
     fixtures::ReturnNull("getPrintImage");
     testing::internal::CaptureStdout();
     EXPECT_EQ(Answer(vdev::kPrn, kImageRequest), "");
