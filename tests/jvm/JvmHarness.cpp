@@ -171,14 +171,6 @@ LocalRef<jbyteArray> ByteArray(const std::string &bytes) {
 }
 
 // The Call* entries: varargs taken here, the call made through Instance/Static.
-#define JVM_INSTANCE_CALL(R, Name, Jni, Failed)                                                         \
-    R Name(jobject obj, const char *name, const char *sig, ...) {                                       \
-        va_list ap;                                                                                     \
-        va_start(ap, sig);                                                                              \
-        R r = Instance(obj, name, sig, Failed, [&](JNIEnv *e, jmethodID m) { return e->Jni(obj, m, ap); }); \
-        va_end(ap);                                                                                     \
-        return r;                                                                                       \
-    }
 #define JVM_STATIC_CALL(R, Name, Jni, Failed)                                                                   \
     R Name(const char *cls, const char *name, const char *sig, ...) {                                           \
         va_list ap;                                                                                             \
@@ -187,10 +179,17 @@ LocalRef<jbyteArray> ByteArray(const std::string &bytes) {
         va_end(ap);                                                                                             \
         return r;                                                                                               \
     }
-JVM_INSTANCE_CALL(jint, CallInt, CallIntMethodV, jint{0})
 JVM_STATIC_CALL(jint, CallStaticInt, CallStaticIntMethodV, jint{0})
 JVM_STATIC_CALL(jboolean, CallStaticBoolean, CallStaticBooleanMethodV, jboolean{JNI_FALSE})
 JVM_STATIC_CALL(jobject, CallStaticObject, CallStaticObjectMethodV, jobject{})
+
+jint CallInt(jobject obj, const char *name, const char *sig, ...) {
+    va_list ap;
+    va_start(ap, sig);
+    jint r = Instance(obj, name, sig, jint{0}, [&](JNIEnv *e, jmethodID m) { return e->CallIntMethodV(obj, m, ap); });
+    va_end(ap);
+    return r;
+}
 
 void CallVoid(jobject obj, const char *name, const char *sig, ...) {
     va_list ap;
