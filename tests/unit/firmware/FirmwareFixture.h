@@ -11,23 +11,20 @@
 
 #include <gtest/gtest.h>
 
-#include <atomic>
-#include <cstdlib>
 #include <cstring>
 #include <filesystem>
-#include <fstream>
-#include <iterator>
 #include <string>
 #include <thread>
 #include <vector>
 
+#include "FwPack.h"
 #include "LoggerHost.h"
 #include "UpdateManagerSim.h"
 #include "adapter/USB.h"
 #include "common/ByteOrder.h"
 #include "firmware/FirmWareUpdate.h"
 #include "firmware/UpdateManager.h"
-#include "FwPack.h"
+#include "support/Bytes.h"
 #include "support/Loopback.h"
 #include "support/RandomBytes.h"
 #include "vdev.h"
@@ -37,11 +34,6 @@ namespace fwtest {
 // The 80-byte header a host puts in front of an image.
 using fwpack::Header;
 
-inline std::string ReadFile(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
-}
-
 inline int OpenDescriptors() {
     int n = 0;
     for ([[maybe_unused]] auto &e : std::filesystem::directory_iterator("/proc/self/fd")) ++n;
@@ -49,18 +41,16 @@ inline int OpenDescriptors() {
 }
 
 // A manager that answers with bytes fixed in advance, all at once, and keeps
-// everything the library sends.
+// everything the library sends. The answers go out once `answerAfter` bytes
+// have come, as a manager answers what it has read.
 class ScriptedPeer {
 public:
-    // The answers go out once `answerAfter` bytes have come, as a manager
-    // answers what it has read.
-    ScriptedPeer(std::string answers, size_t answerAfter) : answers_(std::move(answers)), answerAfter_(answerAfter) {
+    ScriptedPeer(std::string answers, size_t answerAfter) {
         fd_ = LoopbackSocket(4, &port_);
-        thread_ = std::thread([this] { run(); });
+        thread_ = std::thread([this, answers = std::move(answers), answerAfter] { run(answers, answerAfter); });
     }
     ~ScriptedPeer() {
-        stop_ = true;
-        if (thread_.joinable()) thread_.join();
+        finish();
         ::close(fd_);
     }
     uint16_t port() const { return port_; }
@@ -71,51 +61,36 @@ public:
     }
 
 private:
-    void run() {
-        int conn = -1;
-        for (int i = 0; i < 400 && !stop_ && conn < 0; ++i) {
-            pollfd p{fd_, POLLIN, 0};
-            if (::poll(&p, 1, 10) == 1) conn = ::accept(fd_, nullptr, nullptr);
-        }
-        if (conn < 0) return;
-        bool answered = false;
+    void run(const std::string &answers, size_t answerAfter) {
+        pollfd p{fd_, POLLIN, 0};
+        if (::poll(&p, 1, 4000) != 1) return;
+        const int conn = ::accept(fd_, nullptr, nullptr);
+        // A library that never closes ends the exchange after 4 s of silence.
+        const timeval idle{4, 0};
+        ::setsockopt(conn, SOL_SOCKET, SO_RCVTIMEO, &idle, sizeof idle);
         char buf[4096];
-        for (int idle = 0; !stop_ && idle < 400;) {
-            pollfd p{conn, POLLIN, 0};
-            if (::poll(&p, 1, 10) != 1) {
-                ++idle;
-                continue;
-            }
-            ssize_t n = ::recv(conn, buf, sizeof buf, 0);
-            if (n <= 0) break;
+        bool answered = false;
+        for (ssize_t n; (n = ::recv(conn, buf, sizeof buf, 0)) > 0;) {
             received_.append(buf, static_cast<size_t>(n));
-            if (!answered && received_.size() >= answerAfter_) {
-                ::send(conn, answers_.data(), answers_.size(), MSG_NOSIGNAL);
+            if (!answered && received_.size() >= answerAfter) {
+                ::send(conn, answers.data(), answers.size(), MSG_NOSIGNAL);
                 answered = true;
             }
         }
         ::close(conn);
     }
 
-    std::string answers_;
-    size_t answerAfter_;
     int fd_ = -1;
     uint16_t port_ = 0;
-    std::atomic<bool> stop_{false};
     std::thread thread_;
     std::string received_;
-};
-
-// Standard output (the '#' marks, the subsystem words) kept out of the log.
-struct QuietStdout {
-    QuietStdout() { testing::internal::CaptureStdout(); }
-    ~QuietStdout() { testing::internal::GetCapturedStdout(); }
 };
 
 struct Outcome {
     S32 result;
     S32 firmware;
     std::string handedBack;  // the bytes of firmware_command the result counts
+    std::string out;         // standard output: the '#' marks, the subsystem words
 };
 
 class FirmwareTest : public ::testing::Test {
@@ -197,7 +172,9 @@ protected:
         std::memset(out, 0xEE, sizeof out);
         Outcome o{};
         o.firmware = -7;
+        testing::internal::CaptureStdout();
         o.result = FirmWareDownload(fd_, command, commandlen, out, &o.firmware);
+        o.out = testing::internal::GetCapturedStdout();
         if (o.result > 0 && o.result <= FW_PJL_HEADER_SIZE)
             o.handedBack.assign(reinterpret_cast<char *>(out), static_cast<size_t>(o.result));
         return o;
@@ -208,20 +185,16 @@ protected:
     struct Image {
         std::string id, body;
     };
-    static std::string File(const std::vector<Image> &images, std::vector<size_t> *cuts) {
-        std::string f;
-        for (const Image &im : images) {
-            cuts->push_back(f.empty() ? 78 : 80);
-            if (!im.body.empty()) cuts->push_back(im.body.size());
-            f += Header(im.id, static_cast<uint32_t>(im.body.size())) + im.body;
-        }
-        cuts->pop_back();
-        return f;
-    }
     Outcome DownloadImages(const std::vector<Image> &images) {
+        std::string file;
         std::vector<size_t> cuts;
-        std::string f = File(images, &cuts);
-        return Download(f, cuts);
+        for (const Image &im : images) {
+            cuts.push_back(file.empty() ? 78 : 80);
+            if (!im.body.empty()) cuts.push_back(im.body.size());
+            file += Header(im.id, static_cast<uint32_t>(im.body.size())) + im.body;
+        }
+        cuts.pop_back();
+        return Download(file, cuts);
     }
 
     std::string dir_;
