@@ -87,26 +87,20 @@ inline std::vector<Job> Jobs() {
     std::vector<Job> jobs;
     bool open = false;
     for (const Event &e : Events()) {
-        switch (e.kind) {
-        case Kind::Register:
-            if (e.data == "refused") break;
+        if (e.kind == Kind::Register && e.data != "refused") {
             EXPECT_FALSE(open) << "a job was registered while another was open";
             jobs.push_back({});
             open = true;
-            break;
-        case Kind::Pass:
+        } else if (e.kind == Kind::Pass) {
             EXPECT_TRUE(open) << "data passed with no job open";
             if (open) {
                 jobs.back().bytes += e.data;
                 jobs.back().chunks.push_back(e.data.size());
             }
-            break;
-        case Kind::End:
+        } else if (e.kind == Kind::End) {
             EXPECT_TRUE(open) << "a job was ended that was not open";
             if (open) jobs.back().ended = true;
             open = false;
-            break;
-        default: break;
         }
     }
     return jobs;

@@ -3,27 +3,18 @@
 // receives, capability and print-image requests, refusals and read errors, and
 // the reader's life (open and close from Java threads, the configuration event,
 // idling, a close while the host keeps sending).
-#include <fcntl.h>
 #include <sys/msg.h>
-#include <unistd.h>
 
 #include <atomic>
 #include <cstring>
-#include <string>
 #include <thread>
-#include <vector>
 
-#include <gtest/gtest.h>
-
-#include "LoggerHost.h"
-#include "adapter/USB.h"
 #include "common/ByteOrder.h"
 #include "print/PrintRecorder.h"
 #include "scan/USBScan.h"
 #include "scan/scan_thread.h"
 #include "support/Bytes.h"
 #include "support/WaitUntil.h"
-#include "vdev.h"
 #include "vendor/VLX_Main.h"
 
 #define SCAN_JNI(name) Java_com_tarnwel_vbk_common_qz_services_usbadapter_USBAdapterPrintAndScanJNIService_##name
@@ -49,16 +40,12 @@ Forwards Forwarded() {
     return out;
 }
 
-class ScanTest : public ::testing::Test {
+// The print reader's fixture with the scan node open too; the scan tests send
+// on the scan node and turn the scan reader.
+class ScanTest : public ReaderTest {
 protected:
     void SetUp() override {
-        vdev::Reset();
-        LoggerHost_StartCapture();
-        rec::Clear();
-        USBPrint_SetDelivery(&rec::kRecorder);
-        IsConfigured = 1;
-        IsDisconnected = 0;
-        hibernation_flag = 0;
+        ReaderTest::SetUp();
         g_IsScanCanClose = 0;
         fdScan = -1;
         ASSERT_EQ(USBAdpScan_Openfd(), 1);
@@ -67,18 +54,15 @@ protected:
     void TearDown() override {
         if (fdScan > 0) ::close(fdScan);
         fdScan = -1;
-        IsConfigured = 0;
-        IsDisconnected = 0;
         g_IsScanCanClose = 0;
-        USBPrint_SetDelivery(nullptr);
-        vdev::Reset();
+        ReaderTest::TearDown();
     }
 
-    static void Send(const std::vector<std::string> &transfers) {
+    static void ScanSend(const std::vector<std::string> &transfers) {
         for (const std::string &t : transfers) vdev::HostWrite(vdev::kScan, t);
     }
     // Reader turns until the host's bytes are all taken (bounded).
-    static void Drain() {
+    static void ScanDrain() {
         for (int turns = 0; vdev::PendingHostBytes(vdev::kScan) > 0; ++turns) {
             ASSERT_LT(turns, 10000) << "the reader stopped taking host data";
             USBAdpScan_ReadTurn();
@@ -89,8 +73,6 @@ protected:
         return std::string(r.begin(), r.end());
     }
 };
-
-
 
 struct CapResult {
     S32 result;
@@ -158,12 +140,10 @@ TEST_F(Capability, SizeReplyIsTheHeaderWithTheSizeBigEndian) {
     }
 }
 
-// The print reader over the print node with the scan node open too.
-class PrintChannelScan : public ReaderTest {};
+// The print reader over the print node; the scan channel must stay untouched.
+using PrintChannelScan = ScanTest;
 
 TEST_F(PrintChannelScan, HandlersAnswerOnThePrintChannelAndTheNextJobIsWhole) {
-    const int scan = ::open(vdev::kScan, O_RDWR);  // a scan channel that must stay untouched
-    ASSERT_GE(scan, 0);
     const std::string job = kUel + "@PJL JOB\r\n" + std::string(500, 'j') + kUel;
     const std::string pcscan = Bytes({0x1B, 0xA8, 0x24, 0x01, 'p', 'q', 'r'});
     const std::string light = Bytes({0x1B, 0xAA, 0x02, 0x02, 'l', 'm'});
@@ -177,7 +157,6 @@ TEST_F(PrintChannelScan, HandlersAnswerOnThePrintChannelAndTheNextJobIsWhole) {
     EXPECT_EQ(jobs[1].bytes, job);
     EXPECT_EQ(vdev::ReadCalls(vdev::kScan), 0u);
     EXPECT_TRUE(vdev::HostRead(vdev::kPrn).empty());
-    ::close(scan);
 }
 
 
@@ -189,13 +168,6 @@ std::string Scan2AppHeader(int kind, U32 xmlSize) {
 }
 const std::string kIds = Bytes({0x1B, 0x91, 0, 0, 0, 0, 0, 3, 0, 0, 0, 1, 0, 0, 0, 0});
 
-struct Case {
-    const char *name;
-    std::vector<std::string> transfers;  // what the host sends
-    Forwards forwarded;                  // what Java gets
-    std::vector<const char *> lines;     // logged once each
-};
-
 // Each protocol forwards exactly its packet; what no handler takes, or a length
 // past what can be held, is logged and dropped, and the reader goes on.
 TEST_F(ScanTest, EachProtocolForwardsExactlyItsPacketAndDropsTheRest) {
@@ -205,7 +177,12 @@ TEST_F(ScanTest, EachProtocolForwardsExactlyItsPacketAndDropsTheRest) {
     const std::string xml20 = "<apps><a>scan</a></apps>";
     const std::string s2a20 = Scan2AppHeader(3, static_cast<U32>(xml20.size()));
     const char *noXml = "[USBAdp Scan] Error in allocation for pubAppXML, errno: 12\n";
-    const Case cases[] = {
+    const struct {
+        const char *name;
+        std::vector<std::string> transfers;  // what the host sends
+        Forwards forwarded;                  // what Java gets
+        std::vector<const char *> lines;     // logged once each
+    } cases[] = {
         {"pc-scan L 0", {pcscan0}, {{"pcscan", pcscan0}}, {"[USBAdp Scan] slPCScanCDBSize: 4\n"}},
         {"pc-scan set window takes L + 2", {setWindow}, {{"pcscan", setWindow}},
          {"[USBAdp Scan] PCScan packet size for SET WINDOW PARAMETER (1B A8 24 13): 21\n"}},
@@ -234,12 +211,12 @@ TEST_F(ScanTest, EachProtocolForwardsExactlyItsPacketAndDropsTheRest) {
         // 1B 91 and 5 bytes, zero-filled to 16: bytes 7 (3) and 11 (1) are missing.
         {"ID-scan cut", {kIds.substr(0, 7)}, {}, {"[USBAdp Scan] Not IDS packet\n"}},
     };
-    for (const Case &c : cases) {
+    for (const auto &c : cases) {
         SCOPED_TRACE(c.name);
         rec::Clear();
         LoggerHost_StartCapture();
-        Send(c.transfers);
-        Drain();
+        ScanSend(c.transfers);
+        ScanDrain();
         EXPECT_EQ(Forwarded(), c.forwarded);
         for (const char *line : c.lines) EXPECT_EQ(LoggerHost_Count(line), 1) << line;
         EXPECT_EQ(Reply(), "");
@@ -283,8 +260,8 @@ TEST_F(ScanTest, JavaRefusalsEndTheTransferWithItsLine) {
         call = 0;
         failAt = r.failAt;
         LoggerHost_StartCapture();
-        Send({r.packet});
-        Drain();
+        ScanSend({r.packet});
+        ScanDrain();
         EXPECT_EQ(LoggerHost_Count(r.line), 1);
         EXPECT_EQ(call, r.failAt) << "went on after the refusal";
     }
@@ -295,7 +272,7 @@ TEST_F(ScanTest, PacketCutByCloseOrCableIsDroppedWhole) {
         SCOPED_TRACE(cable ? "cable" : "close");
         rec::Clear();
         LoggerHost_StartCapture();
-        Send({Bytes({0x1B, 0xA8, 0x01, 0x10}), "half"});
+        ScanSend({Bytes({0x1B, 0xA8, 0x01, 0x10}), "half"});
         // The host stops; the reader waits out driver time-outs until the channel goes.
         std::thread closer([cable] {
             WaitUntil([] { return vdev::PendingHostBytes(vdev::kScan) == 0; });
@@ -414,7 +391,7 @@ TEST_F(ScanReader, IdlesWithoutTouchingTheNodeUntilItMayRead) {
         LoggerHost_StartCapture();
         IsConfigured = r.configured;
         g_IsScanCanClose = r.closed;
-        Send({Bytes({0x1B, 0xA8, 0, 0})});
+        ScanSend({Bytes({0x1B, 0xA8, 0, 0})});
         std::atomic<bool> done{false};
         std::thread reader([&] {
             USBAdpScan_ReadTurn();
@@ -431,7 +408,7 @@ TEST_F(ScanReader, IdlesWithoutTouchingTheNodeUntilItMayRead) {
         EXPECT_EQ(vdev::ReadCalls(vdev::kScan), 0u);
         EXPECT_EQ(vdev::PollCalls(vdev::kScan), 0u);
         EXPECT_TRUE(rec::Events().empty());
-        Drain();
+        ScanDrain();
         EXPECT_EQ(rec::Apps().size(), 1u);
         rec::Clear();
         vdev::Reset();
@@ -447,7 +424,7 @@ TEST_F(ScanReader, CloseWaitsForThePacketInProgress) {
     for (bool restComes : {true, false}) {
         SCOPED_TRACE(restComes ? "rest comes" : "host silent");
         rec::Clear();
-        Send({head});
+        ScanSend({head});
         std::thread reader([] { USBAdpScan_ReadTurn(); });
         ASSERT_TRUE(WaitUntil([] { return vdev::PendingHostBytes(vdev::kScan) == 0; }));
         std::atomic<jint> closed{0};
