@@ -99,7 +99,12 @@ TEST_F(Identity, DescriptorRequestCarriesIdsStringsAndSizesWithTheirNul) {
         const char *model;
         const char *serial;
         U16 pid;
+        S32 (*set)() = MfpDevSetDesc;
+        std::optional<uint8_t> connect = 1;  // what the device was told last
     } const cases[] = {
+        // First, while nothing has connected: the MAA variant keeps the default
+        // product id and does not connect.
+        {"TW-M4020cdn", "ABC1234567", DEV_PRODUCT_ID, MAAMfpDevSetDesc, std::nullopt},
         {"TW-M4020cdn", "ABC1234567", 0x0121},
         {"tw-m4020CDN Series", "ABC1234567", 0x0121},  // any case, any tail
         {"TW-M4020", "", 0x0110},                      // an empty serial still has its NUL
@@ -110,7 +115,7 @@ TEST_F(Identity, DescriptorRequestCarriesIdsStringsAndSizesWithTheirNul) {
         Put(aub_pd_string, c.model);
         Put(aub_serial_str, c.serial);
         SetDeviceIDString_reOpen();
-        ASSERT_EQ(MfpDevSetDesc(), 0) << c.model;
+        ASSERT_EQ(c.set(), 0) << c.model;
         auto d = vdev::LastDescriptor();
         ASSERT_TRUE(d) << c.model;
         EXPECT_EQ(U16{d->param.uwVid}, DEV_VENDOR_ID);
@@ -123,8 +128,9 @@ TEST_F(Identity, DescriptorRequestCarriesIdsStringsAndSizesWithTheirNul) {
         EXPECT_EQ(d->product, c.model);
         EXPECT_EQ(d->serial, c.serial);
         EXPECT_EQ(d->deviceId, Str(aub_dev1284_str));
-        EXPECT_EQ(vdev::ConnectState(), 1);
+        EXPECT_EQ(vdev::ConnectState(), c.connect);
     }
+    EXPECT_TRUE(LoggerHost_Contains("Setting Descriptors Request made successfully to driver."));
 }
 
 // Every row of the product table is reachable: no earlier prefix hides it.
@@ -135,15 +141,6 @@ TEST_F(Identity, EveryProductTableRowIsReachable) {
     for (U32 i = 0; i < n; ++i)
         EXPECT_EQ(ProductConfig_ProductId(reinterpret_cast<const U8 *>(rows[i].prefix)), rows[i].pid)
             << rows[i].prefix;
-}
-
-TEST_F(Identity, MaaVariantUsesTheDefaultProductIdAndDoesNotConnect) {
-    Put(aub_pd_string, "TW-M4020cdn");
-    ASSERT_EQ(MAAMfpDevSetDesc(), 0);
-    ASSERT_TRUE(vdev::LastDescriptor());
-    EXPECT_EQ(U16{vdev::LastDescriptor()->param.uwPid}, DEV_PRODUCT_ID);
-    EXPECT_FALSE(vdev::ConnectState());
-    EXPECT_TRUE(LoggerHost_Contains("Setting Descriptors Request made successfully to driver."));
 }
 
 TEST_F(Identity, FailedDescriptorOrConnectRequestAnswersMinusOne) {
