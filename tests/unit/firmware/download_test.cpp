@@ -24,36 +24,82 @@ std::string Progress(uint32_t type, int8_t p) {
     return s;
 }
 
-// What is not a firmware header comes back whole, at most its 80 bytes; the
-// rest waits for the print reader.
-TEST_F(FirmwareTest, StreamsThatAreNotFirmwareComeBackAsData) {
-    const std::string almost = Header("E7", 4);
-    const char *const kNotFw = "Not a FirmWare\r\n";
+// One download and what it leaves: the result, the header handed back as data
+// (at most 80 bytes), what stays on the channel for the print reader, the
+// lines logged, all within 3 s; a next job the host sends afterwards arrives
+// whole.
+TEST_F(FirmwareTest, DownloadEndsBoundedAndLeavesTheRestToTheReader) {
+    // kUnreached: a manager listens but must not be connected to; kNobody: a
+    // port nothing listens on.
+    enum Peer { kNone, kManager, kUnreached, kNobody };
+    const std::string almost = Header("E7", 4), pcl = "\x1b%-12345X@PJL ENTER LANGUAGE=PCL\r\n";
+    const std::string job = pcl + "next job", notFw = "Not a FirmWare\r\n", flush = "Data Read Error: can't Flush\n";
+    const std::string body = RandomBytes(3000, 9), image = Header("E8", 500) + RandomBytes(500, 11);
     struct Row {
         const char *what;
+        Peer peer;
         std::string stream;
-        std::vector<const char *> lines;  // logged once each
+        std::vector<size_t> cuts;  // transfers after the first two bytes, the remainder in one
+        S32 result, firmware;      // a positive result: bytes of the stream from handedAt handed back
+        size_t handedAt, left;     // left: trailing bytes of the stream still on the channel
+        std::vector<std::pair<std::string, int>> lines;  // logged that many times
+        bool cablePulled = false;
     } rows[] = {
-        {"FIRMWARE= without blanks", "\x1b%-12345X@PJL\r\n@PJL FIRMWARE=E7  " + std::string(60, 'x'), {kNotFw}},
-        {"first byte after ESC", "\x1b&" + almost.substr(2), {kNotFw}},
-        {"CR LF swapped", almost.substr(0, 13) + "\n\r" + almost.substr(15), {kNotFw}},
-        {"last blank", almost.substr(0, 30) + "x" + almost.substr(31), {kNotFw}},
-        {"lower-case pjl", almost.substr(0, 9) + "@pjl" + almost.substr(13), {kNotFw}},
-        {"a print job", "\x1b%-12345X@PJL ENTER LANGUAGE=PCL\r\n" + std::string(100, 'p'), {kNotFw}},
-        {"a UEL alone", "\x1b%-12345X", {}},
-        {"nothing behind ESC %", "\x1b%", {"Read Failed\r\n", "\r\nread 0 bytes so returning [2]\n"}},
+        // Not firmware: the header comes back, the rest waits for the print reader.
+        {"FIRMWARE= without blanks", kNone, "\x1b%-12345X@PJL\r\n@PJL FIRMWARE=E7  " + std::string(60, 'x'), {78},
+         80, 0, 0, 13, {{notFw, 1}}},
+        {"first byte after ESC", kNone, "\x1b&" + almost.substr(2), {}, 80, 0, 0, 0, {{notFw, 1}}},
+        {"CR LF swapped", kNone, almost.substr(0, 13) + "\n\r" + almost.substr(15), {}, 80, 0, 0, 0, {{notFw, 1}}},
+        {"last blank", kNone, almost.substr(0, 30) + "x" + almost.substr(31), {}, 80, 0, 0, 0, {{notFw, 1}}},
+        {"lower-case pjl", kNone, almost.substr(0, 9) + "@pjl" + almost.substr(13), {}, 80, 0, 0, 0, {{notFw, 1}}},
+        {"a print job", kNone, pcl + std::string(100, 'p'), {78}, 80, 0, 0, 54, {{notFw, 1}}},
+        {"a UEL alone", kNone, "\x1b%-12345X", {}, 9, 0, 0, 0, {}},
+        {"nothing behind ESC %", kNone, "\x1b%", {}, 2, 0, 0, 0,
+         {{"Read Failed\r\n", 1}, {"\r\nread 0 bytes so returning [2]\n", 1}}},
+        // Failures before the body: the body is discarded, the job behind it stays.
+        {"unavailable type", kUnreached, Header("0E7 ", 3000) + body + job, {78, 3000}, -1, 1, 0, job.size(),
+         {{"Firmware Type Unknown\r\n", 1}}},
+        {"garbage id", kUnreached, Header("\x01\xfe??", 3000) + body + job, {78, 3000}, -1, 1, 0, job.size(),
+         {{"Firmware Type Unknown\r\n", 1}}},
+        {"no manager", kNobody, Header("E7", 3000) + body + job, {78, 3000}, -1, 1, 0, job.size(),
+         {{"can't connect to a server!!!\n", 1}, {"Socket Initialization failed\r\n", 1}}},
+        // Cut or over-announced bodies take nothing more.
+        {"announced more than sent", kManager, Header("E7", 10000) + body, {78}, -1, 1, 0, 0, {{flush, 5}}},
+        {"cable pulled inside the body", kManager, Header("E7", 10000) + body, {78}, -1, 1, 0, 0, {{flush, 1}}, true},
+        {"size 0x7fffffff", kManager, Header("E7", 0x7FFFFFFF) + body.substr(0, 100), {78}, -1, 1, 0, 0, {{flush, 5}}},
+        // Negative as a count: nothing is taken as body, so the bytes behind
+        // the header are the next header, here not firmware.
+        {"size 0xffffffff", kManager, Header("E7", 0xFFFFFFFF) + body.substr(0, 100), {78}, 80, 1, 80, 20,
+         {{flush, 0}}},
+        // What follows the last image decides the end.
+        {"nothing after the image", kManager, image, {78, 500}, 0, 1, 0, 0, {}},
+        {"a short read after the image", kManager, image + std::string(40, 's'), {78, 500}, 0, 1, 0, 0, {}},
+        {"79 bytes after the image", kManager, image + std::string(79, 's'), {78, 500}, 0, 1, 0, 0, {}},
+        {"a header after the image that is not firmware", kManager,
+         image + (pcl + std::string(60, 'q')).substr(0, 80), {78, 500}, 80, 1, image.size(), 0, {}},
     };
     for (const Row &r : rows) {
         SCOPED_TRACE(r.what);
-        LoggerHost_StartCapture();
-        Outcome o = Download(r.stream, r.stream.size() > 80 ? std::vector<size_t>{78} : std::vector<size_t>{});
-        const std::string header = r.stream.substr(0, 80);
-        EXPECT_EQ(o.result, static_cast<S32>(header.size()));
-        EXPECT_EQ(o.firmware, 0);
-        EXPECT_EQ(o.handedBack, header);
-        for (const char *line : r.lines) EXPECT_EQ(LoggerHost_Count(line), 1) << line;
-        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), r.stream.size() - header.size());
         ReopenNode();
+        LoggerHost_StartCapture();
+        if (r.peer == kManager || r.peer == kUnreached) StartManager();
+        if (r.peer == kNobody) UsePort(1);
+        IsDisconnected = r.cablePulled;
+        const auto t0 = std::chrono::steady_clock::now();
+        Outcome o = Download(r.stream, r.cuts);
+        EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(3));
+        IsDisconnected = 0;
+        EXPECT_EQ(o.result, r.result);
+        EXPECT_EQ(o.firmware, r.firmware);
+        EXPECT_EQ(o.handedBack, r.result > 0 ? r.stream.substr(r.handedAt, static_cast<size_t>(r.result)) : "");
+        for (const auto &[line, times] : r.lines) EXPECT_EQ(LoggerHost_Count(line), times) << line;
+        if (r.peer == kUnreached) {
+            EXPECT_EQ(manager_.Connections(), 0);
+        }
+        EXPECT_EQ(TakePending(), r.stream.substr(r.stream.size() - r.left));
+        manager_.Stop();
+        vdev::HostWrite(vdev::kPrn, "next job");
+        EXPECT_EQ(TakePending(), "next job");
     }
 }
 
@@ -213,95 +259,6 @@ TEST_F(FirmwareTest, MisbehavingManagerFailsTheDownloadWithinItsTimeOuts) {
     }
 }
 
-TEST_F(FirmwareTest, FailuresBeforeTheBodyDiscardItAndTheNextJobStaysWhole) {
-    const std::string job = "\x1b%-12345X@PJL ENTER LANGUAGE=PCL\r\nnext job";
-    struct Row {
-        const char *what;
-        std::string id;
-        bool manager;
-        std::vector<const char *> lines;  // logged once each
-    } rows[] = {
-        {"unavailable type", "0E7 ", true, {"Firmware Type Unknown\r\n"}},
-        {"garbage id", "\x01\xfe??", true, {"Firmware Type Unknown\r\n"}},
-        {"no manager", "E7", false, {"can't connect to a server!!!\n", "Socket Initialization failed\r\n"}},
-    };
-    for (const Row &r : rows) {
-        SCOPED_TRACE(r.what);
-        LoggerHost_StartCapture();
-        if (r.manager) StartManager();
-        else UsePort(1);  // nothing listens there
-        const std::string body = RandomBytes(3000, 9);
-        Outcome o = Download(Header(r.id, 3000) + body + job, {78, 3000});
-        EXPECT_EQ(o.result, -1);
-        EXPECT_EQ(o.firmware, 1);
-        for (const char *line : r.lines) EXPECT_EQ(LoggerHost_Count(line), 1) << line;
-        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), job.size());
-        EXPECT_EQ(manager_.Connections(), 0);
-        manager_.Stop();
-        ReopenNode();
-    }
-}
-
-TEST_F(FirmwareTest, CutOrOverAnnouncedBodiesEndBoundedAndTakeNothingMore) {
-    struct Row {
-        const char *what;
-        uint32_t announced;
-        size_t sent;
-        bool cablePulled;
-        int flushFailures;
-        S32 result;
-        size_t left;  // bytes of the body the download leaves on the channel
-    } rows[] = {
-        {"announced more than sent", 10000, 3000, false, 5, -1, 0},
-        {"cable pulled inside the body", 10000, 3000, true, 1, -1, 0},
-        {"size 0x7fffffff", 0x7FFFFFFF, 100, false, 5, -1, 0},
-        // Negative as a count: nothing is taken as body, so the bytes behind
-        // the header are the next header, here not firmware.
-        {"size 0xffffffff", 0xFFFFFFFF, 100, false, 0, 80, 20},
-    };
-    for (const Row &r : rows) {
-        SCOPED_TRACE(r.what);
-        LoggerHost_StartCapture();
-        StartManager();
-        IsDisconnected = r.cablePulled;
-        auto t0 = std::chrono::steady_clock::now();
-        Outcome o = Download(Header("E7", r.announced) + RandomBytes(r.sent, 10), {78});
-        EXPECT_LT(std::chrono::steady_clock::now() - t0, std::chrono::seconds(3));
-        EXPECT_EQ(o.result, r.result);
-        EXPECT_EQ(o.firmware, 1);
-        EXPECT_EQ(LoggerHost_Count("Data Read Error: can't Flush\n"), r.flushFailures);
-        EXPECT_EQ(vdev::PendingHostBytes(vdev::kPrn), r.left);
-        IsDisconnected = 0;
-        manager_.Stop();
-        // The next job after the host's silence is untouched by the failure.
-        vdev::HostWrite(vdev::kPrn, "next job");
-        EXPECT_EQ(TakePending().substr(r.left), "next job");
-    }
-}
-
-TEST_F(FirmwareTest, WhatFollowsTheLastImageDecidesTheEnd) {
-    StartManager();
-    const std::string body = RandomBytes(500, 11);
-    const std::string second = "\x1b%-12345X@PJL ENTER LANGUAGE=PCL\r\n" + std::string(60, 'q');
-    struct Row {
-        const char *what;
-        std::string after;
-        S32 result;
-        std::string handedBack;
-    } rows[] = {
-        {"nothing", "", 0, ""},
-        {"a short read", std::string(40, 's'), 0, ""},
-        {"79 bytes", std::string(79, 's'), 0, ""},
-        {"a header that is not firmware", second.substr(0, 80), 80, second.substr(0, 80)},
-    };
-    for (const Row &r : rows) {
-        SCOPED_TRACE(r.what);
-        Outcome o = Download(Header("E8", 500) + body + r.after, {78, 500});
-        EXPECT_EQ(o.result, r.result);
-        EXPECT_EQ(o.firmware, 1);
-        EXPECT_EQ(o.handedBack, r.handedBack);
-    }
-}
 
 // The print reader's view: the classifier's firmware branch, then a print job.
 TEST_F(FirmwareTest, ClassifierReportsTheDownloadAndTheReaderGoesOn) {
