@@ -56,7 +56,10 @@ TEST_F(BridgeQueues, ReportFileIsWrittenOnceWithThePlaceholderSerialAndTheModel)
     }
 }
 
-TEST_F(BridgeQueues, QueuesUseTheKeyFileWithProjectIdsFiveAndSix) {
+// The queues are made on the key file with project ids 5 and 6; made again,
+// the existing ones are reused with what they hold: the one initialisation
+// message of eight bytes.
+TEST_F(BridgeQueues, QueuesOnTheKeyFileAreReusedWithTheInitMessage) {
     ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
     const std::string keyFile = root / FTOK_FILE;
     ASSERT_TRUE(std::filesystem::exists(keyFile));
@@ -65,15 +68,23 @@ TEST_F(BridgeQueues, QueuesUseTheKeyFileWithProjectIdsFiveAndSix) {
     EXPECT_NE(globalPrnMsgQ.load(), globalScanMsgQ.load());
     EXPECT_TRUE(LoggerHost_Contains("[USBAdp][USB]Prn_MsgQ created with message queue id : "));
     EXPECT_TRUE(LoggerHost_Contains("[USBAdp][USB]Scan_MsgQ created with message queue id : "));
-}
 
-TEST_F(BridgeQueues, ExistingQueuesAreReusedWithWhatTheyHold) {
-    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
     const int first = globalPrnMsgQ;
     ASSERT_EQ(USBAdapter_IF_InitDevice(), 1);
+    EXPECT_EQ(LoggerHost_Count("[USBAdp][USB]Message sent for initialization.. \n"), 1);
     ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
     EXPECT_EQ(globalPrnMsgQ.load(), first);
-    EXPECT_EQ(TakeQueueStatus(globalPrnMsgQ), MFP_DEV_INIT);
+
+    struct {
+        long mtype;
+        unsigned char text[64];
+    } raw{};
+    ssize_t n = msgrcv(globalPrnMsgQ, &raw, sizeof raw.text, 0, IPC_NOWAIT);
+    ASSERT_EQ(n, 8);
+    EXPECT_EQ(raw.mtype, 1);
+    EXPECT_EQ(raw.text[0] | raw.text[1] << 8 | raw.text[2] << 16 | raw.text[3] << 24, MFP_DEV_INIT);
+    EXPECT_EQ(TakeQueueStatus(globalPrnMsgQ), std::nullopt);
+    EXPECT_EQ(TakeQueueStatus(globalScanMsgQ), std::nullopt);
 }
 
 TEST_F(BridgeQueues, MissingDirectoryFailsCleanlyAndMakesNoQueue) {
@@ -101,23 +112,6 @@ TEST_F(BridgeQueues, MissingDirectoryFailsCleanlyAndMakesNoQueue) {
         EXPECT_EQ(globalScanMsgQ.load(), -1);
         std::filesystem::create_directories(root / "/halvard/sys/statusinfo");
     }
-}
-
-TEST_F(BridgeQueues, InitDevicePostsOneInitMessageOfEightBytes) {
-    ASSERT_EQ(USBAdapter_IF_CreatePrnScanMsgQs("M"), 1);
-    ASSERT_EQ(USBAdapter_IF_InitDevice(), 1);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp][USB]Message sent for initialization.. \n"), 1);
-
-    struct {
-        long mtype;
-        unsigned char text[64];
-    } raw{};
-    ssize_t n = msgrcv(globalPrnMsgQ, &raw, sizeof raw.text, 0, IPC_NOWAIT);
-    ASSERT_EQ(n, 8);
-    EXPECT_EQ(raw.mtype, 1);
-    EXPECT_EQ(raw.text[0] | raw.text[1] << 8 | raw.text[2] << 16 | raw.text[3] << 24, MFP_DEV_INIT);
-    EXPECT_EQ(TakeQueueStatus(globalPrnMsgQ), std::nullopt);
-    EXPECT_EQ(TakeQueueStatus(globalScanMsgQ), std::nullopt);
 }
 
 // ---- the SIGIO handler --------------------------------------------------
