@@ -74,20 +74,6 @@ protected:
     }
 };
 
-struct CapResult {
-    S32 result;
-    std::string held;  // what vlx_command holds (result bytes) when the result is a count
-};
-
-CapResult Cap(S32 fd, const std::string &command) {
-    U8 vlx_command[16];
-    std::memset(vlx_command, 0xEE, sizeof vlx_command);
-    std::string copy = command;
-    CapResult r{Vlx_Cap_Xml(fd, reinterpret_cast<U8 *>(copy.data()), static_cast<S32>(copy.size()), vlx_command), {}};
-    if (r.result > 0) r.held.assign(reinterpret_cast<char *>(vlx_command), static_cast<size_t>(r.result));
-    return r;
-}
-
 using Capability = ScanTest;
 
 TEST_F(Capability, RequestsAreRecognisedByTheirLeadingBytes) {
@@ -113,10 +99,13 @@ TEST_F(Capability, RequestsAreRecognisedByTheirLeadingBytes) {
     for (const Row &r : rows) {
         SCOPED_TRACE(r.name);
         if (!r.behind.empty()) vdev::HostWrite(vdev::kScan, r.behind);
-        CapResult got = Cap(fd, r.command);
-        EXPECT_EQ(got.result, r.result);
+        std::string command = r.command;
+        U8 held[16];  // what the command buffer holds when the result is a count
+        std::memset(held, 0xEE, sizeof held);
+        EXPECT_EQ(Vlx_Cap_Xml(fd, reinterpret_cast<U8 *>(command.data()), static_cast<S32>(command.size()), held),
+                  r.result);
         if (r.result > 0) {
-            EXPECT_EQ(got.held, r.held);
+            EXPECT_EQ(std::string(reinterpret_cast<char *>(held), static_cast<size_t>(r.result)), r.held);
         }
         EXPECT_EQ(vdev::PendingHostBytes(vdev::kScan), r.left);
         EXPECT_EQ(Reply(), "");
