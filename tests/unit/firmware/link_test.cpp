@@ -1,7 +1,5 @@
 // The pieces under the download: firmware types, the checksum, the requests
 // and blocks on the update-manager socket, and its receive time-out.
-#include <sys/socket.h>
-
 #include <chrono>
 
 #include "FirmwareFixture.h"

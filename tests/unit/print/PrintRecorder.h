@@ -138,19 +138,15 @@ inline void ExpectLoggedOnce(const char *line) {
 class ReaderTest : public ::testing::Test {
 protected:
     void SetUp() override {
-        vdev::Reset();
         LoggerHost_StartCapture();
-        rec::Clear();
         USBPrint_SetDelivery(&rec::kRecorder);
         ASSERT_EQ(USBAdapter_AllocateReadBuffers(), 1);
-        ResetReader();
         // The reader runs its passes only while the host has configured the device.
         IsConfigured = 1;
         IsDisconnected = 0;
         hibernation_flag = 0;
-        fdPrn = ::open(vdev::kPrn, O_RDWR);
+        Restart(true);
         ASSERT_GT(fdPrn.load(), 0);
-        vdev::SetInstantTimeouts(vdev::kPrn, true);
     }
     void TearDown() override {
         if (fdPrn > 0) ::close(fdPrn);

@@ -1,8 +1,6 @@
 // The classifier on the emulated print node: which class two bytes select,
 // what is handed back for print delivery, and the four application packets
 // that share ESC 0x91.
-#include <fcntl.h>
-
 #include <cstring>
 #include <thread>
 
@@ -202,24 +200,17 @@ TEST_F(Classifier, UnreadableBodyFailsDcuButSendsNdAndFaxdHeadersToPrintData) {
 // What the host had sent of a body is gone with the cable: the packet is
 // dropped, and its header is no print job either.
 TEST_F(Classifier, BodyCutByACablePullIsDroppedAndMakesNoPrintJob) {
-    const struct {
-        U8 app;
-        const char *line;
-    } rows[] = {
-        {0x07, "[USBAdp] [DCU] Body cut after 4 of 10 bytes, packet dropped\n"},
-        {0x0D, "[USBAdp] [ND] Body cut after 4 of 10 bytes, packet dropped\n"},
-        {0x0E, "[USBAdp] [FAXD] Body cut after 4 of 10 bytes, packet dropped\n"},
-    };
-    for (const auto &r : rows) {
-        SCOPED_TRACE(int{r.app});
+    const std::pair<U8, std::string> rows[] = {{0x07, "DCU"}, {0x0D, "ND"}, {0x0E, "FAXD"}};
+    for (const auto &[app, tag] : rows) {
+        SCOPED_TRACE(tag);
         Restart();
-        vdev::HostWrite(vdev::kPrn, AppHeader(r.app, 10));
+        vdev::HostWrite(vdev::kPrn, AppHeader(app, 10));
         vdev::HostWrite(vdev::kPrn, "part");
         IsDisconnected = 1;  // the pull comes while the reader waits for the rest
         USBAdapter_ReadPass();
         IsDisconnected = 0;
         EXPECT_TRUE(rec::Events().empty());
-        EXPECT_EQ(LoggerHost_Count(r.line), 1);
+        EXPECT_EQ(LoggerHost_Count("[USBAdp] [" + tag + "] Body cut after 4 of 10 bytes, packet dropped\n"), 1);
         EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in executing Host App\n"), 1);
         LoggerHost_StartCapture();
     }

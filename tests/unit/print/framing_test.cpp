@@ -4,8 +4,6 @@
 #include <chrono>
 #include <functional>
 #include <random>
-#include <string>
-#include <vector>
 
 #include "print/PrintRecorder.h"
 #include "support/RandomBytes.h"

@@ -6,9 +6,7 @@
 // at the Java side, and silence still ends a job on time. (Pins a departure:
 // signals are not time-outs.) Also: a node that reports readiness but gives
 // nothing must not make the reader spin.
-#include <fcntl.h>
 #include <pthread.h>
-#include <unistd.h>
 
 #include <atomic>
 #include <chrono>
