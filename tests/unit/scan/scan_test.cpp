@@ -3,8 +3,6 @@
 // receives, capability and print-image requests, refusals and read errors, and
 // the reader's life (open and close from Java threads, the configuration event,
 // idling, a close while the host keeps sending).
-#include <sys/msg.h>
-
 #include <atomic>
 #include <cstring>
 #include <thread>
@@ -14,6 +12,7 @@
 #include "scan/USBScan.h"
 #include "scan/scan_thread.h"
 #include "support/Bytes.h"
+#include "support/MsgQueue.h"
 #include "support/WaitUntil.h"
 #include "vendor/VLX_Main.h"
 
@@ -360,10 +359,8 @@ TEST_F(ScanReader, EventsBeforeConfigurationAreIgnoredOneByOne) {
     EXPECT_EQ(LoggerHost_Count("[USBAdp Scan] Unknown event:5\n"), 1);
     EXPECT_EQ(LoggerHost_Count("[USBAdp Scan] Received MFP_DEV_CONFIGURED event\n"), 1);
     // What follows stays in the queue: the scan side reads no more events.
-    TMessageBuf rest{};
-    EXPECT_EQ(msgrcv(queue, &rest, MSGBUF_TEXT_SIZE, 0, IPC_NOWAIT), MSGBUF_TEXT_SIZE);
-    EXPECT_EQ(rest.status, 0x07);
-    msgctl(queue, IPC_RMID, nullptr);
+    EXPECT_EQ(TakeQueueStatus(queue), 0x07);
+    RemoveQueue(queue);
     globalScanMsgQ = -1;
 }
 
