@@ -113,6 +113,8 @@ TEST_F(Classifier, PrintDataIsHandedBackWithTheBytesTaken) {
 // The application packets behind ESC 0x91, each one transfer to Java of its
 // header and body; AMPV has no body, whatever its length says. An empty DCU
 // body, Java refusing the transfer and an unknown application send nothing.
+// A body that cannot be read (a read error on the node) fails DCU, and sends
+// the ND and FAXD headers back to print data.
 TEST_F(Classifier, ApplicationPacketIsOneTransferOfHeaderAndBody) {
     const struct {
         U8 app;
@@ -122,6 +124,7 @@ TEST_F(Classifier, ApplicationPacketIsOneTransferOfHeaderAndBody) {
         S32 result;
         const char *type;  // of the transfer; nullptr: none
         const char *line, *line2;
+        bool unreadable = false;
     } rows[] = {
         {0x07, 5, "<dcu>", 0, 0, "dcu", "[USBAdp] [DCU] DCU Packet length: 5\n", "[USBAdp] DCU packet\n"},
         {0x07, 0, "", 0, -2, nullptr, "[USBAdp] [DCU] slDCUPacketLen[0] <= 0\n",
@@ -133,11 +136,17 @@ TEST_F(Classifier, ApplicationPacketIsOneTransferOfHeaderAndBody) {
         {0x0D, 0, "", -1, -2, nullptr, "[USBAdp] [ND] Error in Sending ND AppType\n",
          "[USBAdp] Error in sending ND packet\n"},
         {0x55, 4, "tail", 0, -1, nullptr, "[USBAdp] [DCU] pubCommand[7]: 0x55\n", nullptr},
+        {0x07, 10, "", 0, -2, nullptr, "[USBAdp] Error in sending DCU packet\n", nullptr, true},
+        {0x0D, 10, "", 0, -1, nullptr, nullptr, nullptr, true},
+        {0x0E, 10, "", 0, -1, nullptr, nullptr, nullptr, true},
     };
     for (const auto &r : rows) {
         SCOPED_TRACE(testing::Message() << "app " << int{r.app} << ", length " << r.length);
         Restart(true);
         LoggerHost_StartCapture();
+        if (r.unreadable) {
+            ASSERT_EQ(::fcntl(fdPrn, F_SETFL, O_NONBLOCK), 0);  // reads fail instead of waiting
+        }
         rec::appAnswer = r.answer;
         const std::string hdr = AppHeader(r.app, r.length);
         Outcome o = Classify(hdr.substr(0, 2), {hdr.substr(2), r.body});
@@ -176,25 +185,6 @@ TEST_F(Classifier, BodyWaitsOutDriverTimeOutsUntilItIsComplete) {
     ASSERT_EQ(apps.size(), 1u);
     EXPECT_EQ(apps[0].writes, (std::vector<std::string>{hdr, "fax1fax2"}));
     EXPECT_EQ(LoggerHost_Count("[USBAdp] [FAXD] read bytes from FAXD App, slRet: 0\n"), 3);
-}
-
-TEST_F(Classifier, UnreadableBodyFailsDcuButSendsNdAndFaxdHeadersToPrintData) {
-    // A read error on the node: reads fail instead of waiting.
-    ASSERT_EQ(::fcntl(fdPrn, F_SETFL, O_NONBLOCK), 0);
-    std::string dcu = AppHeader(0x07, 10);
-    Outcome o = Classify(dcu.substr(0, 2), {dcu.substr(2)});
-    EXPECT_EQ(o.result, -2);
-    EXPECT_EQ(LoggerHost_Count("[USBAdp] Error in sending DCU packet\n"), 1);
-
-    for (U8 app : {U8{0x0D}, U8{0x0E}}) {
-        SCOPED_TRACE(int{app});
-        std::string hdr = AppHeader(app, 10);
-        o = Classify(hdr.substr(0, 2), {hdr.substr(2)});
-        EXPECT_EQ(o.result, -1);
-        EXPECT_EQ(o.firmRes, 16);
-        EXPECT_EQ(o.handedBack, hdr);
-    }
-    EXPECT_TRUE(rec::Apps().empty());
 }
 
 // What the host had sent of a body is gone with the cable: the packet is
