@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "LoggerHost.h"
+#include "adapter/USB.h"
 #include "maa/MAA_Address.h"
 #include "maa/MAA_IF.h"
 #include "maa/MAA_MM.h"
@@ -67,30 +68,45 @@ inline TMAAResult *scan1(U32 a) {
     return r;
 }
 
-class ShellTest : public ::testing::Test {
+// What every test of the shell starts and ends with, here and in the session
+// and test-function tests: no symbols, an empty address map, no literals, a
+// plugged-in cable, a normal run and caught log lines.
+class ShellBase : public ::testing::Test {
 protected:
     void SetUp() override {
         MAA_SymbolClear();
         MAA_AddrReset();
         written.clear();
-        calls.clear();
-        texts.clear();
+        IsDisconnected = 0;
         enSpecialMode = MAA_NORMAL_CMD;
-        MAA_SetResultWriter(&Capture);
         LoggerHost_StartCapture();
     }
     void TearDown() override {
         MAA_FreeParamString();
         MAA_AddrReset();
         MAA_SymbolClear();
+        IsDisconnected = 0;
+        enSpecialMode = MAA_NORMAL_CMD;
         MAA_SetResultWriter(nullptr);
         LoggerHost_StopCapture();
     }
 
+    // A command line through the shell.
     static U32 run(const std::string &line) {
         lineBuffer = line;
         MAA_InputSet(reinterpret_cast<const U8 *>(lineBuffer.c_str()));
         return MAA_Parser();
+    }
+    inline static std::string lineBuffer;
+};
+
+class ShellTest : public ShellBase {
+protected:
+    void SetUp() override {
+        ShellBase::SetUp();
+        calls.clear();
+        texts.clear();
+        MAA_SetResultWriter(&Capture);
     }
 
     // A registered 4-byte variable of the test.
@@ -110,8 +126,6 @@ protected:
         auto v = values();
         return v.empty() ? std::string() : v.back();
     }
-
-    inline static std::string lineBuffer;
 };
 
 }  // namespace maatest

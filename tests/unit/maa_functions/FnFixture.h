@@ -6,25 +6,15 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <gtest/gtest.h>
-
 #include <algorithm>
 #include <list>
-#include <string>
-#include <vector>
 
-#include "LoggerHost.h"
-#include "adapter/USB.h"
-#include "maa/MAA_Address.h"
 #include "maa/MAA_Hook.h"
-#include "maa/MAA_IF.h"
-#include "maa/MAA_Parser.h"
-#include "maa/MAA_Symbol.h"
 #include "maa/MAA_Result.h"
+#include "maa/ShellFixture.h"
 #include "maa/functions/MAA_CpuTemp.h"
 #include "maa/functions/MAA_Panel.h"
 #include "maa/functions/MAA_SysResult.h"
-#include "support/MaaRecords.h"
 #include "support/TempRoot.h"
 #include "vdev.h"
 #include "vendor/VLX_Main.h"
@@ -43,32 +33,26 @@ inline size_t CountOf(const std::vector<unsigned long> &requests, unsigned long 
     return static_cast<size_t>(std::count(requests.begin(), requests.end(), request));
 }
 
-class FnTest : public ::testing::Test {
+class FnTest : public maatest::ShellBase {
 protected:
     void SetUp() override {
-        MAA_AddrReset();
-        IsDisconnected = 0;
-        enSpecialMode = MAA_NORMAL_CMD;
+        ShellBase::SetUp();
         MAA_SetResultWriter(&Capture);
         MAA_SetCommandRunner(&RecordCommand);
         MAA_SetSleeper(&RecordSleep);
         MAA_PanelSetWaits(50, 50, 50);  // no UI server answers unless a test starts one
-        LoggerHost_StartCapture();
         Restart();
         ASSERT_GT(channel, 0);
     }
     void TearDown() override {
         ::close(channel);
         vdev::Reset();
-        MAA_AddrReset();
-        MAA_SetResultWriter(nullptr);
         MAA_SetCommandRunner(nullptr);
         MAA_SetSleeper(nullptr);
         MAA_SetCmdString(nullptr);
         MAA_SetMachineName(nullptr);
         MAA_PanelSetWaits(0, 0, 0);
-        MAA_SymbolClear();
-        LoggerHost_StopCapture();
+        ShellBase::TearDown();
     }
     // A clean model, channel and catch, also between the rows of a table.
     void Restart() {
@@ -83,10 +67,7 @@ protected:
     // A command line through the shell, with the registered vocabulary.
     static U32 Run(const std::string &line) {
         if (pstRoot == nullptr) MAA_SymbolReg();
-        static std::string kept;
-        kept = line;
-        MAA_InputSet(reinterpret_cast<const U8 *>(kept.c_str()));
-        return MAA_Parser();
+        return run(line);
     }
     // What the host receives from one command line through the shell.
     static Recs HostSees(const std::string &line) {

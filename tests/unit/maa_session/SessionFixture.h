@@ -5,27 +5,17 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <gtest/gtest.h>
-
 #include <chrono>
 #include <functional>
 #include <future>
-#include <string>
-#include <vector>
 
-#include "LoggerHost.h"
 #include "adapter/Classifier.h"
-#include "adapter/USB.h"
 #include "common/ByteOrder.h"
-#include "maa/MAA_Address.h"
-#include "maa/MAA_Hook.h"
-#include "maa/MAA_IF.h"
-#include "maa/MAA_MM.h"
-#include "maa/MAA_Result.h"
-#include "maa/MAA_Symbol.h"
-#include "print/PrintRecorder.h"
-#include "support/MaaRecords.h"
 #include "common/Wait.h"
+#include "maa/MAA_Hook.h"
+#include "maa/MAA_Result.h"
+#include "maa/ShellFixture.h"
+#include "print/PrintRecorder.h"
 #include "vdev.h"
 #include "vendor/VLX_Main.h"
 
@@ -83,31 +73,23 @@ struct Outcome {
     std::string wire;     // everything the device wrote
 };
 
-class SessionTest : public ::testing::Test {
+class SessionTest : public maatest::ShellBase {
 protected:
     void SetUp() override {
-        vdev::Reset();
-        IsDisconnected = 0;
+        ShellBase::SetUp();
         maa_session::slPollTimeout = MAA_POLL_TIMEOUT_FIRST;
-        enSpecialMode = MAA_NORMAL_CMD;
         MAA_HeapFree(stCmdHeap.ulHeapPtr, 0);
         stCmdHeap = {};
-        MAA_SymbolClear();
-        MAA_AddrReset();
         probes.clear();
         MAA_SymbolAdd(ftarget_ppc, "probe", MAA_SYM_FUNC, MAA_FuncEntry<probe>(), 1);
         MAA_SymbolAdd(ftarget_ppc, "peek", MAA_SYM_FUNC, MAA_FuncEntry<peek>(), 2);
-        LoggerHost_StartCapture();
         Reopen();
         ASSERT_GT(fd, 0);
     }
     void TearDown() override {
         ::close(fd);
         vdev::Reset();
-        IsDisconnected = 0;
-        MAA_SymbolClear();
-        MAA_SetResultWriter(nullptr);
-        LoggerHost_StopCapture();
+        ShellBase::TearDown();
     }
 
     // A fresh print node and channel.

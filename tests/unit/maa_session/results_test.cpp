@@ -29,22 +29,13 @@ int InChild(const std::function<int()> &body, unsigned seconds) {
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
-class ResultTest : public ::testing::Test {
+class ResultTest : public maatest::ShellBase {
 protected:
     void SetUp() override {
+        ShellBase::SetUp();
         ASSERT_GE(channel.device, 0);
         ulDrvHandle = static_cast<U32>(channel.device);
-        IsDisconnected = 0;
-        enSpecialMode = MAA_NORMAL_CMD;
-        MAA_AddrReset();
         MAA_SetResultWriter(&MAA_WriteResultFrame);
-        LoggerHost_StartCapture();
-    }
-    void TearDown() override {
-        IsDisconnected = 0;
-        enSpecialMode = MAA_NORMAL_CMD;
-        MAA_SetResultWriter(nullptr);
-        LoggerHost_StopCapture();
     }
     std::vector<std::string> Writes() { return channel.Writes(); }
     PacketChannel channel;
