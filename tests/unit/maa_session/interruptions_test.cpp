@@ -2,13 +2,9 @@
 // bridge's SIGIO reaches whatever thread the kernel picks), a channel that
 // reports readiness and gives nothing, and a cable pulled in the middle of a
 // start command. (The signal cases pin a departure: signals are not time-outs.)
-#include <pthread.h>
-
-#include <atomic>
 #include <thread>
 
 #include "maa_session/SessionFixture.h"
-#include "print/PrintRecorder.h"
 #include "support/CpuTime.h"
 #include "support/SignalStorm.h"
 #include "support/WaitUntil.h"

@@ -1,11 +1,9 @@
 // What the shell writes back: result and transfer frames write by write (a
 // packet socket keeps each write apart), Dump_File, and the start-up files.
 #include <sys/msg.h>
-#include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 
-#include <csignal>
 #include <cstdio>
 #include <thread>
 
