@@ -90,18 +90,17 @@ TEST_F(Lexer, ConstantsAreDecimalHexadecimalOrCharactersAndDropOverflowingDigits
     }
 }
 
+// Text, base, value and the characters taken.
 TEST_F(Lexer, StringToNumberConversion) {
-    const U8 *end = nullptr;
-    auto logic = [&end](const char *text, U32 base) { return MAA_Logic(reinterpret_cast<const U8 *>(text), &end, base); };
-    const char *text = "  -1z";
-    EXPECT_EQ(logic(text, 10), ~1u);  // complement, not negation
-    EXPECT_EQ(end, reinterpret_cast<const U8 *>(text + 4));
-    EXPECT_EQ(logic("017", 0), 15u);
-    EXPECT_EQ(logic("0x10", 0), 16u);
-    EXPECT_EQ(logic("zz", 36), 36u * 35 + 35);
-    text = "xyz";
-    EXPECT_EQ(logic(text, 10), 0u);
-    EXPECT_EQ(end, reinterpret_cast<const U8 *>(text));
+    const struct { const char *text; U32 base, value; size_t taken; } cases[] = {
+        {"  -1z", 10, ~1u, 4},  // complement, not negation
+        {"017", 0, 15, 3}, {"0x10", 0, 16, 4}, {"zz", 36, 36 * 35 + 35, 2}, {"xyz", 10, 0, 0},
+    };
+    for (const auto &c : cases) {
+        const U8 *end = nullptr;
+        EXPECT_EQ(MAA_Logic(reinterpret_cast<const U8 *>(c.text), &end, c.base), c.value) << c.text;
+        EXPECT_EQ(end, reinterpret_cast<const U8 *>(c.text + c.taken)) << c.text;
+    }
 }
 
 TEST_F(Lexer, StringLiteralsAreDecodedRecordedAndAddressable) {

@@ -2,6 +2,7 @@
 // host's scripts rely on, written out independently of the table; and calling
 // it through the shell the way a host script does: names that reach a family's
 // shared function, and every name called with hostile arguments.
+#include <algorithm>
 #include <map>
 #include <set>
 #include <sstream>

@@ -112,14 +112,6 @@ protected:
         return {ret, std::string(reinterpret_cast<char *>(cmd), sizeof cmd), Str(vdev::HostRead(vdev::kPrn))};
     }
 
-    // The saved-command buffer as written so far, with the NUL behind.
-    static std::string SavedCommands() {
-        return std::string(reinterpret_cast<char *>(stCmdHeap.ulHeapPtr), stCmdHeap.ulHeapIndex + 1);
-    }
-
-    // Host bytes nobody has taken yet: in the node, or read ahead and put back.
-    size_t Untaken() const { return vdev::PendingHostBytes(vdev::kPrn) + Wait_PutBackLeft(fd); }
-
     int fd = -1;
 };
 
