@@ -35,7 +35,6 @@ protected:
         ulDrvHandle = static_cast<U32>(channel.device);
         MAA_SetResultWriter(&MAA_WriteResultFrame);
     }
-    std::vector<std::string> Writes() { return channel.Writes(); }
     PacketChannel channel;
 };
 
@@ -82,7 +81,7 @@ TEST_F(ResultTest, FramesAndTheirWrites) {
     for (const Row &r : rows) {
         SCOPED_TRACE(r.name);
         r.action();
-        EXPECT_EQ(Writes(), r.writes);
+        EXPECT_EQ(channel.Writes(), r.writes);
     }
 }
 
@@ -92,7 +91,7 @@ TEST_F(ResultTest, PulledCableIsLoggedNeverFatal) {
     MAA_WriteResult(&r);
     MAA_ResponseOK();
     EXPECT_EQ(MAA_SendCmdToHost(0, MAA_FILE_END), 0u);
-    EXPECT_TRUE(Writes().empty());
+    EXPECT_TRUE(channel.Writes().empty());
     EXPECT_EQ(LoggerHost_Count("\r\n[MAA:MAA_WriteResult1] Cable Disconnected during MAA_WriteResult"), 1);
     EXPECT_EQ(LoggerHost_Count("\r\n[MAA:MAA_WriteResult2] Cable Disconnected during MAA_WriteResult"), 1);
     EXPECT_EQ(LoggerHost_Count("\r\n[MAA:MAA_ResponseOK] Cable Disconnected during MAA_ResponseOK"), 1);
@@ -121,7 +120,7 @@ TEST_F(ResultTest, DumpFileSendsLinesUntilTheFirstEmptyOne) {
         TMAAResult *res = Dump_File(address);
         std::vector<std::string> want;
         for (const std::string &l : r.lines) want.insert(want.end(), {Frame(0, 0, l).substr(0, 12), l});
-        EXPECT_EQ(Writes(), want);
+        EXPECT_EQ(channel.Writes(), want);
         ASSERT_NE(res, nullptr);
         EXPECT_EQ(Of(res), End(r.last, r.result));
     }
@@ -138,7 +137,7 @@ TEST_F(ResultTest, DumpFileRefusesWhatIsNoTextFileAndStopsWhenTheHostIsGone) {
         const U32 address = MAA_AddrMap(path.data(), static_cast<U32>(path.size() + 1));
         EXPECT_EQ(InChild([&] { return Of(Dump_File(address)) == End("File Open Error " + path, 0) ? 0 : 1; }, 5), 0)
             << "-1: still dumping after 5 s, 1: not answered with the open error";
-        EXPECT_TRUE(Writes().empty());
+        EXPECT_TRUE(channel.Writes().empty());
         MAA_AddrUnmap(address);
     }
 
@@ -151,7 +150,7 @@ TEST_F(ResultTest, DumpFileRefusesWhatIsNoTextFileAndStopsWhenTheHostIsGone) {
     IsDisconnected = 1;
     Dump_File(MAA_AddrMap(path.data(), static_cast<U32>(path.size() + 1)));
     EXPECT_EQ(LoggerHost_Count("\r\n[MAA] Dump_File: cable disconnected, dump stopped"), 1);
-    EXPECT_TRUE(Writes().empty());
+    EXPECT_TRUE(channel.Writes().empty());
 }
 
 TEST(StartUp, UsbSpeedFileGetsHighWithoutTruncation) {
