@@ -139,24 +139,19 @@ TEST_F(CpuTemp, FanTestsRunTheirCommandsAndReadTheStatusFiles) {
     }
 }
 
-TEST_F(CpuTemp, MachineNamesGiveTheControllerClass) {
+// The machine name gives the controller class; the mono class refuses the
+// temperature test before the mode check, the others fail without the print
+// service (with it, whether a case reaches Java is the JVM tests' part).
+TEST_F(CpuTemp, MachineNamesGiveTheControllerClassAndMonoRefusesTheTemperatureTest) {
+    ASSERT_EQ(globalPrintObj.load(), nullptr);
     const std::pair<const char *, S32> cases[] = {{"i686", 0},    {"x86_64", 0},  {"ppc", 1}, {"powerpc64", 1},
                                                   {"armv5tel", 2}, {"armv7l", -1}, {"aarch64", -1}, {"", -1}};
     for (const auto &[machine, model] : cases) {
+        SCOPED_TRACE(machine);
         MAA_SetMachineName(machine);
-        EXPECT_EQ(currentmcmodel(), model) << machine;
-    }
-}
-
-// The mono refusal comes before the mode check; with the print service,
-// whether a case reaches Java is the JVM tests' part.
-TEST_F(CpuTemp, TemperatureRefusalsEndAtOnce) {
-    ASSERT_EQ(globalPrintObj.load(), nullptr);
-    for (U32 mode : {0u, 7u}) {
-        MAA_SetMachineName("armv5tel");
-        EXPECT_EQ(Seen(CheckCPUTemperature(mode)), Recs{End("Do not support Mono Model")});
-        MAA_SetMachineName("x86_64");
-        EXPECT_EQ(Seen(CheckCPUTemperature(mode)), Recs{End("Failed")});  // no print-service object
+        EXPECT_EQ(currentmcmodel(), model);
+        const std::string refusal = model == 2 ? "Do not support Mono Model" : "Failed";
+        for (U32 mode : {0u, 7u}) EXPECT_EQ(Seen(CheckCPUTemperature(mode)), Recs{End(refusal)}) << mode;
     }
     EXPECT_TRUE(commands.empty());
 }
