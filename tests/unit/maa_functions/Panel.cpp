@@ -88,7 +88,8 @@ TEST_F(Panel, ClientTestsSendTheirRequestAndMapTheAnswer) {
             usePort(server.port());
             const auto start = std::chrono::steady_clock::now();
             EXPECT_EQ(HostSees(c.line), (Recs{Cont(c.header), a.final.empty() ? Cont(c.header) : End(a.final)}));
-            EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));  // not the operator's minutes
+            // Not the operator's minutes.
+            EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));
             ASSERT_TRUE(server.awaitServed(1, 2000));
             EXPECT_EQ(server.requests(), std::vector<std::string>{c.request});
         }
