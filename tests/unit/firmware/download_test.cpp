@@ -259,7 +259,6 @@ TEST_F(FirmwareTest, MisbehavingManagerFailsTheDownloadWithinItsTimeOuts) {
     }
 }
 
-
 // The print reader's view: the classifier's firmware branch, then a print job.
 TEST_F(FirmwareTest, ClassifierReportsTheDownloadAndTheReaderGoesOn) {
     StartManager();
@@ -285,6 +284,9 @@ TEST_F(FirmwareTest, ClassifierReportsTheDownloadAndTheReaderGoesOn) {
         EXPECT_EQ(USBAdpater_StartDataClassifier(cmd, fw, &firmRes, &id), r.result);
         testing::internal::GetCapturedStdout();
         EXPECT_EQ(LoggerHost_Count(r.line), 1);
+        // The download took its file and nothing of the job behind it.
+        vdev::HostWrite(vdev::kPrn, "next job");
+        EXPECT_EQ(TakePending(), "next job");
     }
     fdPrn = 0;
 }
