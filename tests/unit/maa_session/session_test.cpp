@@ -305,6 +305,8 @@ TEST_F(SessionRoad, WrongStartCommandIsPrintData) {
     auto jobs = rec::Jobs();
     ASSERT_EQ(jobs.size(), 1u);
     EXPECT_EQ(jobs[0].bytes, "\x1bwMAASTARXrest of the job");
+    // Like any data the classifier hands back, it waits for the next transfer.
+    EXPECT_EQ(jobs[0].chunks, std::vector<size_t>{25});
     EXPECT_TRUE(vdev::HostRead(vdev::kPrn).empty());
 }
 
