@@ -7,6 +7,7 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdint>
 
 inline sockaddr_in LoopbackAddress(uint16_t port) {
@@ -33,11 +34,17 @@ inline int LoopbackSocket(int backlog, uint16_t *port) {
     return fd;
 }
 
-// A connection to `port`, or -1.
+// A connection to `port`, or -1. A signal does not stop the handshake, so a
+// connect it interrupts is waited out by connecting again: giving up would
+// leave a connection the other side may already have accepted.
 inline int LoopbackConnect(uint16_t port) {
     const int fd = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    if (fd < 0) return -1;
     const sockaddr_in sa = LoopbackAddress(port);
-    if (fd >= 0 && ::connect(fd, reinterpret_cast<const sockaddr *>(&sa), sizeof sa) == 0) return fd;
-    if (fd >= 0) ::close(fd);
+    int rc;
+    while ((rc = ::connect(fd, reinterpret_cast<const sockaddr *>(&sa), sizeof sa)) != 0 && errno == EINTR) {
+    }
+    if (rc == 0 || errno == EISCONN) return fd;
+    ::close(fd);
     return -1;
 }
