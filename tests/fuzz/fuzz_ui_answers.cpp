@@ -182,9 +182,9 @@ public:
         if (fd_ < 0) connect();  // a client test may have connected and never waited
         if (fd_ >= 0) {
             take();
-            ::close(fd_);
+            closeAtOnce(fd_);
         }
-        for (int extra; (extra = ::accept4(listenFd, nullptr, nullptr, SOCK_CLOEXEC)) >= 0;) ::close(extra);
+        for (int extra; (extra = ::accept4(listenFd, nullptr, nullptr, SOCK_CLOEXEC)) >= 0;) closeAtOnce(extra);
         return o_;
     }
 
@@ -199,6 +199,14 @@ public:
     }
 
 private:
+    // The test is done with the connection. A reset leaves no TIME_WAIT behind:
+    // thousands of them a second would fill loopback's port range and slow
+    // every later connect.
+    static void closeAtOnce(int fd) {
+        const linger reset{1, 0};
+        ::setsockopt(fd, SOL_SOCKET, SO_LINGER, &reset, sizeof reset);
+        ::close(fd);
+    }
     static int unacknowledged(int fd) {
         int n = 0;
         return ::ioctl(fd, SIOCOUTQ, &n) == 0 ? n : 0;
